@@ -1,0 +1,95 @@
+# kx_library(NAME [GLOBS pattern...] [EXCLUDE regex] [DEPS target...])
+# A static library of all *.cpp below the calling folder (or of GLOBS), less the paths that match
+# EXCLUDE (relative to the folder). A folder without sources becomes an INTERFACE library.
+function(kx_library name)
+  cmake_parse_arguments(arg "" "EXCLUDE" "GLOBS;DEPS" ${ARGN})
+  if(NOT arg_GLOBS)
+    set(arg_GLOBS *.cpp)
+  endif()
+  file(GLOB_RECURSE sources RELATIVE ${CMAKE_CURRENT_SOURCE_DIR} CONFIGURE_DEPENDS ${arg_GLOBS})
+  if(arg_EXCLUDE)
+    list(FILTER sources EXCLUDE REGEX "${arg_EXCLUDE}")
+  endif()
+  if(sources)
+    add_library(${name} STATIC ${sources})
+    target_link_libraries(${name} PUBLIC kx_options ${arg_DEPS})
+  else()
+    add_library(${name} INTERFACE)
+    target_link_libraries(${name} INTERFACE kx_options ${arg_DEPS})
+  endif()
+endfunction()
+
+# kx_program(NAME MAIN candidate... DEPS target...)
+# A program whose main file is the first candidate that exists; none exists: no program.
+function(kx_program name)
+  cmake_parse_arguments(arg "" "" "MAIN;DEPS" ${ARGN})
+  foreach(candidate IN LISTS arg_MAIN)
+    file(GLOB found CONFIGURE_DEPENDS ${candidate})
+    if(found)
+      add_executable(${name} ${candidate})
+      target_link_libraries(${name} PRIVATE kx_options ${arg_DEPS})
+      install(TARGETS ${name} RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
+      return()
+    endif()
+  endforeach()
+endfunction()
+
+# Gives in OUT the googletest filter patterns of the concurrency tests among FILES: every suite or
+# test with "Concurrency" in its name, and every suite of a file with it in the file's name.
+function(_kx_concurrency_patterns out files)
+  set(patterns "*Concurrency*")
+  foreach(file IN LISTS files)
+    if(file MATCHES "Concurrency[^/]*$")
+      set_property(DIRECTORY APPEND PROPERTY CMAKE_CONFIGURE_DEPENDS ${file})
+      file(STRINGS ${file} lines REGEX "^ *(TEST|TEST_F|TEST_P|RC_GTEST_PROP)\\(")
+      foreach(line IN LISTS lines)
+        string(REGEX REPLACE "^[^(]*\\( *([A-Za-z0-9_]+).*" "\\1" suite "${line}")
+        list(APPEND patterns "*${suite}.*")
+      endforeach()
+    endif()
+  endforeach()
+  list(REMOVE_DUPLICATES patterns)
+  list(JOIN patterns ":" patterns)
+  set(${out} "${patterns}" PARENT_SCOPE)
+endfunction()
+
+# kx_test(FOLDER [CONCURRENCY] [PROGRAMS] [LIBRARIES target...])
+# tests/FOLDER/*.cpp -> executable test_FOLDER, each of its tests an entry of ctest with the label
+# FOLDER, and "concurrency" where _kx_concurrency_patterns says so or, with CONCURRENCY, on all.
+# PROGRAMS: the tests run our programs or load the module, so these are built before.
+function(kx_test folder)
+  cmake_parse_arguments(arg "CONCURRENCY;PROGRAMS" "" "LIBRARIES" ${ARGN})
+  set(here ${PROJECT_SOURCE_DIR}/tests/${folder})
+  file(GLOB_RECURSE sources CONFIGURE_DEPENDS ${here}/*.cpp)
+  set(tests ${sources})
+  list(FILTER tests INCLUDE REGEX "Test\\.cpp$")
+  if(NOT tests)
+    return()
+  endif()
+  set(target test_${folder})
+  add_executable(${target} ${sources})
+  target_link_libraries(${target} PRIVATE kx_options ${arg_LIBRARIES} kx_testing rapidcheck
+                        GTest::gmock_main GTest::gmock GTest::gtest)
+  target_compile_definitions(${target} PRIVATE
+    KX_TEST_SOURCE_DIR="${PROJECT_SOURCE_DIR}"
+    KX_TEST_BIN_DIR="${CMAKE_RUNTIME_OUTPUT_DIRECTORY}"
+    KX_TEST_PLUGIN_PATH="${CMAKE_LIBRARY_OUTPUT_DIRECTORY}/kxsyncbundle.so")
+  if(arg_PROGRAMS)
+    foreach(program IN ITEMS kxsyncbundle kxsync ferrule)
+      if(TARGET ${program})
+        add_dependencies(${target} ${program})
+      endif()
+    endforeach()
+  endif()
+  set(common DISCOVERY_MODE PRE_TEST DISCOVERY_TIMEOUT 60)
+  if(arg_CONCURRENCY)
+    gtest_discover_tests(${target} ${common} PROPERTIES TIMEOUT 300 LABELS "${folder}\;concurrency")
+  else()
+    _kx_concurrency_patterns(patterns "${tests}")
+    gtest_discover_tests(${target} ${common} TEST_FILTER "-${patterns}"
+                         PROPERTIES TIMEOUT 300 LABELS ${folder})
+    gtest_discover_tests(${target} ${common} TEST_FILTER "${patterns}"
+                         TEST_LIST ${target}_CONCURRENCY
+                         PROPERTIES TIMEOUT 300 LABELS "${folder}\;concurrency")
+  endif()
+endfunction()
