@@ -53,6 +53,17 @@ function(_kx_concurrency_patterns out files)
   set(${out} "${patterns}" PARENT_SCOPE)
 endfunction()
 
+# Sets OUT when a concurrency test is among FILES.
+function(_kx_has_concurrency out files)
+  set(${out} FALSE PARENT_SCOPE)
+  foreach(file IN LISTS files)
+    file(STRINGS ${file} lines REGEX "^ *(TEST|TEST_F|TEST_P|RC_GTEST_PROP)\\(.*Concurrency")
+    if(lines OR file MATCHES "Concurrency[^/]*$")
+      set(${out} TRUE PARENT_SCOPE)
+    endif()
+  endforeach()
+endfunction()
+
 # kx_test(FOLDER [CONCURRENCY] [PROGRAMS] [LIBRARIES target...])
 # tests/FOLDER/*.cpp -> executable test_FOLDER, each of its tests an entry of ctest with the label
 # FOLDER, and "concurrency" where _kx_concurrency_patterns says so or, with CONCURRENCY, on all.
@@ -82,14 +93,23 @@ function(kx_test folder)
     endforeach()
   endif()
   set(common DISCOVERY_MODE PRE_TEST DISCOVERY_TIMEOUT 60)
+  _kx_has_concurrency(concurrent "${tests}")
+  if(arg_CONCURRENCY OR concurrent)
+    set_property(GLOBAL APPEND PROPERTY KX_CONCURRENCY_TARGETS ${target})
+  endif()
   if(arg_CONCURRENCY)
-    gtest_discover_tests(${target} ${common} PROPERTIES TIMEOUT 300 LABELS "${folder}\;concurrency")
+    gtest_discover_tests(${target} ${common} TEST_LIST ${target}_CONCURRENCY
+                         PROPERTIES TIMEOUT 300)
   else()
     _kx_concurrency_patterns(patterns "${tests}")
     gtest_discover_tests(${target} ${common} TEST_FILTER "-${patterns}"
                          PROPERTIES TIMEOUT 300 LABELS ${folder})
     gtest_discover_tests(${target} ${common} TEST_FILTER "${patterns}"
-                         TEST_LIST ${target}_CONCURRENCY
-                         PROPERTIES TIMEOUT 300 LABELS "${folder}\;concurrency")
+                         TEST_LIST ${target}_CONCURRENCY PROPERTIES TIMEOUT 300)
   endif()
+  # Two labels cannot be given above (a list does not survive there), so ctest sets them itself.
+  set(labels ${CMAKE_CURRENT_BINARY_DIR}/${target}_labels.cmake)
+  file(WRITE ${labels} "if(${target}_CONCURRENCY)\n  set_tests_properties(\${${target}_CONCURRENCY}"
+                       " PROPERTIES LABELS \"${folder};concurrency\")\nendif()\n")
+  set_property(DIRECTORY APPEND PROPERTY TEST_INCLUDE_FILES ${labels})
 endfunction()
