@@ -1,0 +1,125 @@
+#pragma once
+
+#include <cstdint>
+#include <functional>
+#include <map>
+#include <memory>
+#include <optional>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "platform/Platform.h"
+
+namespace kx {
+
+// What has failed on the device since the last reset: the proof that a sync was whole. Fetches,
+// library transactions, save batches and imports note their failures here. Any thread.
+class DeviceHealth {
+ public:
+  struct ImportFailure {
+    std::string uuid;
+    ErrorPtr error;
+  };
+  virtual ~DeviceHealth() = default;
+  // Forgets everything; the daemon calls it before prepareForSync.
+  virtual void reset() = 0;
+  virtual void noteFailure(std::string what, ErrorPtr error) = 0;
+  virtual void noteImportFailure(std::string uuid, ErrorPtr error) = 0;
+  virtual bool anyFailure() const = 0;
+  virtual std::vector<ImportFailure> importFailures() const = 0;
+  // First failure that was no import's, null when there was none.
+  virtual ErrorPtr firstFailure() const = 0;
+};
+
+// What the library's transactions have changed since the last reset, by UUID. Any thread.
+struct LibraryChanges {
+  std::set<std::string> importedAssets, deletedAssets, updatedAssets;
+  std::set<std::string> createdContainers, deletedContainers, renamedContainers;
+};
+
+// The library's content as a value, for `dump` and `status` (docs/formats/dump.md).
+struct DeviceDump {
+  struct Pending {
+    std::int32_t type = 1;
+    std::uint32_t count = 0;
+  };
+  struct Container {
+    std::string uuid;
+    std::optional<std::string> title;
+    std::int32_t kind = 0;
+    Pending pending;
+    std::vector<std::string> assets;  // in the album's order
+  };
+  struct Face {
+    std::uint16_t identifier = 0;
+    Rect relativeRect;
+    std::optional<std::string> albumUUID;
+  };
+  struct Asset {
+    std::string uuid;
+    std::int32_t savedAssetType = 0;
+    bool isVideo = false;
+    std::optional<Date> creationDate, modificationDate;
+    std::optional<double> sortToken;
+    std::optional<Coordinate> location;
+    std::optional<std::string> originalFileName;
+    std::vector<Face> faces;  // by identifier
+    std::string path;
+    std::int64_t size = 0;
+    bool incomplete = false;
+    std::optional<std::string> sha256;
+  };
+  std::vector<Container> albums, events, faceAlbums;  // in list order
+  std::vector<Asset> assets;                          // in row order
+  Pending camera, syncProgress, otaRestoreProgress;
+  std::optional<std::string> currentLibraryUUID;
+  struct SyncAgent {
+    std::optional<std::string> userAgent, libraryKind;
+  };
+  std::optional<SyncAgent> syncAgent;
+  bool lastSynced = false;
+};
+
+struct DeviceOptions {
+  std::string root;       // the directory that stands for the device's root
+  bool create = false;    // make it, and the library, when missing
+  bool readOnly = false;  // for status, dump and metrics: takes no lock, changes nothing
+  LogSinks logs;
+  Clock* clock = nullptr;  // null: the real one; must outlive the device
+};
+
+// The reference device: a photo library on SQLite with its asset daemon quarryd and real files, all
+// beneath one directory. Opening for writing takes the device's lock (an error names the holder's
+// pid), recovers from an unclean stop and starts quarryd; destruction ends quarryd and closes.
+// Threads: open and destroy on one thread; accessors from any.
+class ReferenceDevice {
+ public:
+  // Null and an error. Domain "com.veltro.kxdevice"; see the codes below.
+  static std::unique_ptr<ReferenceDevice> open(const DeviceOptions& options, ErrorPtr* error);
+  virtual ~ReferenceDevice() = default;
+
+  virtual Platform& platform() = 0;
+  virtual DeviceHealth& health() = 0;
+  virtual LibraryChanges takeChanges() = 0;  // since the last call
+  // Waits until quarryd and the library's queue have nothing to do.
+  virtual void drain() = 0;
+  // One consistent reading; works in a read-only device too. `hash` adds SHA-256 of the files.
+  virtual DeviceDump dump(bool hash, ErrorPtr* error) = 0;
+};
+
+inline constexpr const char* kDeviceErrorDomain = "com.veltro.kxdevice";
+enum class DeviceError : std::int64_t {
+  kMissing = 1,       // no such directory (and create is false)
+  kNotOurs = 2,       // not a directory of ours: other owner, or no device where one is needed
+  kLocked = 3,        // another process holds the device; userInfo "pid"
+  kNewerSchema = 4,   // the library was written by a newer version
+  kDamaged = 5,       // the database fails its check
+  kNoSpace = 6,       // ENOSPC, EDQUOT or SQLITE_FULL
+  kIo = 7,            // any other system error; userInfo "errno"
+  kBadFile = 8,       // an import: missing, no regular file, wrong size
+  kForeignAsset = 9,  // an import whose UUID is a device-made asset's
+  kBadJob = 10,       // a save job that does not decode
+};
+
+}  // namespace kx
