@@ -1,0 +1,36 @@
+import os
+import subprocess
+import unittest
+
+import planted_tree
+
+
+class CheckModule(planted_tree.PlantedTree):
+    check = "check_module.py"
+
+    def build(self, text, *options):
+        self.plant("a.cpp", text)
+        module = os.path.join(self.root, "a.so")
+        subprocess.run([os.environ.get("CXX", "c++"), "-shared", "-fPIC", "-o", module,
+                        os.path.join(self.root, "a.cpp"), *options], check=True)
+        self.root = module
+
+    def test_module_with_one_entry_is_green(self):
+        self.build('extern "C" int kxEntry() { return 1; }\n')
+        self.assert_green()
+
+    def test_needed_library_is_red(self):
+        self.build('extern "C" int kxEntry() { return 1; }\n', "-Wl,--no-as-needed", "-lsqlite3")
+        self.assert_red("needs libsqlite3.so")
+
+    def test_second_symbol_is_red(self):
+        self.build('extern "C" int kxEntry() { return 1; }\nint Other() { return 2; }\n')
+        self.assert_red("shows _Z5Otherv")
+
+    def test_module_without_entry_is_red(self):
+        self.build("static int a;\n")
+        self.assert_red("shows 0 entry points")
+
+
+if __name__ == "__main__":
+    unittest.main()
