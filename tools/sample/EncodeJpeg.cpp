@@ -105,20 +105,29 @@ Code NumberBits(int value) {
   return {static_cast<unsigned>(bits), length};
 }
 
-Block Transform(const Block& samples) {
-  Block out{};
+// Cosines of the transform: row u, column x.
+Block MakeCosines() {
   constexpr double kPi = 3.14159265358979323846;
-  for (int v = 0; v < kBlock; ++v) {
-    for (int u = 0; u < kBlock; ++u) {
+  Block out{};
+  for (int u = 0; u < kBlock; ++u) {
+    for (int x = 0; x < kBlock; ++x) {
+      const double scale = u == 0 ? std::sqrt(0.125) : 0.5;
+      out[static_cast<std::size_t>(u * kBlock + x)] = scale * std::cos((2 * x + 1) * u * kPi / 16);
+    }
+  }
+  return out;
+}
+
+// Transforms the rows and transposes; done twice, it transforms a block.
+Block TransformRows(const Block& in, const Block& cosines) {
+  Block out{};
+  for (std::size_t row = 0; row < kBlock; ++row) {
+    for (std::size_t u = 0; u < kBlock; ++u) {
       double sum = 0;
-      for (int y = 0; y < kBlock; ++y) {
-        for (int x = 0; x < kBlock; ++x) {
-          sum += samples[static_cast<std::size_t>(y * kBlock + x)] *
-                 std::cos((2 * x + 1) * u * kPi / 16) * std::cos((2 * y + 1) * v * kPi / 16);
-        }
+      for (std::size_t x = 0; x < kBlock; ++x) {
+        sum += in[row * kBlock + x] * cosines[u * kBlock + x];
       }
-      const double scale = (u == 0 ? std::sqrt(0.5) : 1) * (v == 0 ? std::sqrt(0.5) : 1) / 4;
-      out[static_cast<std::size_t>(v * kBlock + u)] = sum * scale;
+      out[u * kBlock + row] = sum;
     }
   }
   return out;
@@ -139,7 +148,8 @@ class Encoder {
   Encoder(const Picture& picture, int quality)
       : picture_(picture),
         dc_(MakeCodes(kDcCounts, kDcValues)),
-        ac_(MakeCodes(kAcCounts, kAcValues)) {
+        ac_(MakeCodes(kAcCounts, kAcValues)),
+        cosines_(MakeCosines()) {
     const int scale = quality < 50 ? 5000 / quality : 200 - 2 * quality;
     for (std::size_t index = 0; index < kCoefficients; ++index) {
       steps_[index] = std::clamp((kLuminance[index] * scale + 50) / 100, 1, 255);
@@ -223,7 +233,7 @@ class Encoder {
             Sample(picture_.at(left + x, top + y), component);
       }
     }
-    const Block frequencies = Transform(samples);
+    const Block frequencies = TransformRows(TransformRows(samples, cosines_), cosines_);
     QuantizedBlock out{};
     for (std::size_t index = 0; index < kCoefficients; ++index) {
       const std::size_t from = kZigZag[index];
@@ -254,6 +264,7 @@ class Encoder {
   const Picture& picture_;
   CodeTable dc_;
   CodeTable ac_;
+  Block cosines_;
   std::array<int, kCoefficients> steps_{};
   std::string out_;
 };
