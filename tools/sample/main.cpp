@@ -23,155 +23,89 @@ struct Face {
   double width;
 };
 
-struct Photo {
-  std::string path;
-  std::string taken;   // EXIF's form, wall-clock time
-  std::string offset;  // from UTC; empty when the camera did not say
-  double latitude;     // degrees; 0 and 0: no place
-  double longitude;
+struct Moment {
+  std::string taken;    // EXIF's form, wall-clock time
+  double latitude = 0;  // degrees; 0 and 0: no place
+  double longitude = 0;
+};
+
+// What is drawn, and what a person has added to it.
+struct Scene {
   kx::Colour sky;
   kx::Colour ground;
   std::string caption;
-  int rating;
+  int rating = 0;
   std::vector<Face> faces;
+};
+
+struct Photo {
+  std::string path;
+  std::string offset;  // of the time taken, from UTC; empty when the camera did not say
+  Moment moment;
+  Scene scene;
 };
 
 const kx::Colour kWhite{245, 245, 250};
 
-std::vector<Photo> SamplePhotos() {
-  const Face ada{"Ada", 0.35, 0.55, 0.22};
-  const Face grace{"Grace", 0.68, 0.52, 0.20};
-  const kx::Colour green{70, 140, 60};
-  const kx::Colour sand{220, 200, 140};
-  return {
-      {"Mountains/IMG_0001.jpg",
-       "2023:06:10 08:15:00",
-       "+02:00",
-       46.5775,
-       7.9856,
-       {90, 150, 230},
-       green,
-       "The first peak",
-       5,
-       {}},
-      {"Mountains/IMG_0002.jpg",
-       "2023:06:10 09:40:12",
-       "+02:00",
-       46.5801,
-       7.9902,
-       {60, 120, 220},
-       {120, 120, 125},
-       "",
-       0,
-       {ada}},
-      {"Mountains/IMG_0003.jpg",
-       "2023:06:10 13:05:48",
-       "+02:00",
-       46.5839,
-       8.0011,
-       {130, 180, 240},
-       kWhite,
-       "Snow in June",
-       4,
-       {ada, grace}},
-      {"Mountains/IMG_0004.jpg",
-       "2023:06:11 17:30:00",
-       "+02:00",
-       46.5702,
-       7.9790,
-       {240, 160, 90},
-       {60, 70, 90},
-       "",
-       0,
-       {}},
-      {"Seaside/DSC00101.jpg",
-       "2023:08:02 10:00:00",
-       "+01:00",
-       50.2660,
-       -5.0527,
-       {110, 190, 250},
-       sand,
-       "Low tide",
-       0,
-       {grace}},
-      {"Seaside/DSC00102.jpg",
-       "2023:08:02 11:20:31",
-       "+01:00",
-       50.2671,
-       -5.0533,
-       {80, 170, 240},
-       {30, 110, 170},
-       "",
-       3,
-       {}},
-      {"Seaside/DSC00103.jpg",
-       "2023:08:02 15:45:09",
-       "+01:00",
-       50.2659,
-       -5.0519,
-       {150, 210, 250},
-       sand,
-       "",
-       0,
-       {ada, grace}},
-      {"Seaside/DSC00104.jpg",
-       "2023:08:03 20:58:00",
-       "+01:00",
-       50.2690,
-       -5.0498,
-       {250, 120, 80},
-       {40, 50, 110},
-       "Sunset",
-       5,
-       {}},
-      {"Birthday/party-1.jpg",
-       "2023:12:16 15:00:00",
-       "",
-       0,
-       0,
-       {250, 210, 220},
-       {150, 90, 60},
-       "",
-       0,
-       {grace}},
-      {"Birthday/party-2.jpg",
-       "2023:12:16 15:10:42",
-       "",
-       0,
-       0,
-       {250, 230, 180},
-       {150, 90, 60},
-       "The cake",
-       4,
-       {}},
-      {"Birthday/party-3.jpg",
-       "2023:12:16 15:42:07",
-       "",
-       0,
-       0,
-       {220, 210, 250},
-       {130, 80, 60},
-       "",
-       0,
-       {ada}},
-      {"Birthday/party-4.jpg",
-       "2023:12:16 16:30:55",
-       "",
-       0,
-       0,
-       {210, 240, 220},
-       {140, 80, 50},
-       "Everybody",
-       5,
-       {ada, grace}},
+const kx::Colour kGreen{70, 140, 60};
+const kx::Colour kSand{220, 200, 140};
+const kx::Colour kTable{150, 90, 60};
+const Face kAda{"Ada", 0.35, 0.55, 0.22};
+const Face kGrace{"Grace", 0.68, 0.52, 0.20};
+
+void AddMountains(std::vector<Photo>& photos) {
+  const auto add = [&](const std::string& name, const Moment& moment, const Scene& scene) {
+    photos.push_back(Photo{"Mountains/" + name, "+02:00", moment, scene});
   };
+  add("IMG_0001.jpg", {"2023:06:10 08:15:00", 46.5775, 7.9856},
+      {{90, 150, 230}, kGreen, "The first peak", 5, {}});
+  add("IMG_0002.jpg", {"2023:06:10 09:40:12", 46.5801, 7.9902},
+      {{60, 120, 220}, {120, 120, 125}, "", 0, {kAda}});
+  add("IMG_0003.jpg", {"2023:06:10 13:05:48", 46.5839, 8.0011},
+      {{130, 180, 240}, kWhite, "Snow in June", 4, {kAda, kGrace}});
+  add("IMG_0004.jpg", {"2023:06:11 17:30:00", 46.5702, 7.9790},
+      {{240, 160, 90}, {60, 70, 90}, "", 0, {}});
+}
+
+void AddSeaside(std::vector<Photo>& photos) {
+  const auto add = [&](const std::string& name, const Moment& moment, const Scene& scene) {
+    photos.push_back(Photo{"Seaside/" + name, "+01:00", moment, scene});
+  };
+  add("DSC00101.jpg", {"2023:08:02 10:00:00", 50.2660, -5.0527},
+      {{110, 190, 250}, kSand, "Low tide", 0, {kGrace}});
+  add("DSC00102.jpg", {"2023:08:02 11:20:31", 50.2671, -5.0533},
+      {{80, 170, 240}, {30, 110, 170}, "", 3, {}});
+  add("DSC00103.jpg", {"2023:08:02 15:45:09", 50.2659, -5.0519},
+      {{150, 210, 250}, kSand, "", 0, {kAda, kGrace}});
+  add("DSC00104.jpg", {"2023:08:03 20:58:00", 50.2690, -5.0498},
+      {{250, 120, 80}, {40, 50, 110}, "Sunset", 5, {}});
+}
+
+// A camera that knows neither place nor time zone.
+void AddBirthday(std::vector<Photo>& photos) {
+  const auto add = [&](const std::string& name, const std::string& taken, const Scene& scene) {
+    photos.push_back(Photo{"Birthday/" + name, "", Moment{taken}, scene});
+  };
+  add("party-1.jpg", "2023:12:16 15:00:00", {{250, 210, 220}, kTable, "", 0, {kGrace}});
+  add("party-2.jpg", "2023:12:16 15:10:42", {{250, 230, 180}, kTable, "The cake", 4, {}});
+  add("party-3.jpg", "2023:12:16 15:42:07", {{220, 210, 250}, kTable, "", 0, {kAda}});
+  add("party-4.jpg", "2023:12:16 16:30:55",
+      {{210, 240, 220}, {140, 80, 50}, "Everybody", 5, {kAda, kGrace}});
+}
+
+std::vector<Photo> SamplePhotos() {
+  std::vector<Photo> photos;
+  AddMountains(photos);
+  AddSeaside(photos);
+  AddBirthday(photos);
+  return photos;
 }
 
 kx::Picture Draw(const Photo& photo) {
   kx::Picture picture(320, 240);
-  picture.FillGradient(photo.sky, kWhite);
-  picture.FillHills(0.6, 1.5, photo.ground);
-  for (const Face& face : photo.faces) {
+  picture.FillGradient(photo.scene.sky, kWhite);
+  picture.FillHills(0.6, 1.5, photo.scene.ground);
+  for (const Face& face : photo.scene.faces) {
     picture.DrawFace(face.x, face.y, face.width,
                      face.name == "Ada" ? kx::Colour{235, 190, 160} : kx::Colour{170, 120, 90});
   }
@@ -188,16 +122,16 @@ std::string Degrees(double value) {
 void AddExif(const Photo& photo, Exiv2::ExifData& exif) {
   exif["Exif.Image.Make"] = "Sample";
   exif["Exif.Image.Model"] = "Drawn by kxsync";
-  exif["Exif.Image.DateTime"] = photo.taken;
-  exif["Exif.Photo.DateTimeOriginal"] = photo.taken;
+  exif["Exif.Image.DateTime"] = photo.moment.taken;
+  exif["Exif.Photo.DateTimeOriginal"] = photo.moment.taken;
   exif["Exif.Image.Orientation"] = std::uint16_t{1};
   if (!photo.offset.empty()) exif["Exif.Photo.OffsetTimeOriginal"] = photo.offset;
-  if (photo.latitude == 0 && photo.longitude == 0) return;
+  if (photo.moment.latitude == 0 && photo.moment.longitude == 0) return;
   exif["Exif.GPSInfo.GPSVersionID"] = "2 3 0 0";
-  exif["Exif.GPSInfo.GPSLatitudeRef"] = photo.latitude < 0 ? "S" : "N";
-  exif["Exif.GPSInfo.GPSLatitude"] = Degrees(photo.latitude);
-  exif["Exif.GPSInfo.GPSLongitudeRef"] = photo.longitude < 0 ? "W" : "E";
-  exif["Exif.GPSInfo.GPSLongitude"] = Degrees(photo.longitude);
+  exif["Exif.GPSInfo.GPSLatitudeRef"] = photo.moment.latitude < 0 ? "S" : "N";
+  exif["Exif.GPSInfo.GPSLatitude"] = Degrees(photo.moment.latitude);
+  exif["Exif.GPSInfo.GPSLongitudeRef"] = photo.moment.longitude < 0 ? "W" : "E";
+  exif["Exif.GPSInfo.GPSLongitude"] = Degrees(photo.moment.longitude);
 }
 
 void AddStructure(Exiv2::XmpData& xmp, const std::string& key, bool isBag) {
@@ -212,7 +146,7 @@ void AddStructure(Exiv2::XmpData& xmp, const std::string& key, bool isBag) {
 
 // Faces as regions of the Metadata Working Group's form: centres and sizes in shares.
 void AddFaces(const Photo& photo, const kx::Picture& picture, Exiv2::XmpData& xmp) {
-  if (photo.faces.empty()) return;
+  if (photo.scene.faces.empty()) return;
   const std::string regions = "Xmp.mwg-rs.Regions";
   AddStructure(xmp, regions, false);
   const std::string dimensions = regions + "/mwg-rs:AppliedToDimensions";
@@ -222,7 +156,7 @@ void AddFaces(const Photo& photo, const kx::Picture& picture, Exiv2::XmpData& xm
   xmp[dimensions + "/stDim:unit"] = "pixel";
   AddStructure(xmp, regions + "/mwg-rs:RegionList", true);
   int index = 0;
-  for (const Face& face : photo.faces) {
+  for (const Face& face : photo.scene.faces) {
     const std::string region = regions + "/mwg-rs:RegionList[" + std::to_string(++index) + "]";
     AddStructure(xmp, region, false);
     xmp[region + "/mwg-rs:Name"] = face.name;
@@ -251,8 +185,9 @@ void Write(const std::filesystem::path& folder, const Photo& photo) {
   image->readMetadata();
   AddExif(photo, image->exifData());
   AddFaces(photo, picture, image->xmpData());
-  if (!photo.caption.empty()) image->xmpData()["Xmp.dc.description"] = photo.caption;
-  if (photo.rating > 0) image->xmpData()["Xmp.xmp.Rating"] = std::to_string(photo.rating);
+  if (!photo.scene.caption.empty()) image->xmpData()["Xmp.dc.description"] = photo.scene.caption;
+  if (photo.scene.rating > 0)
+    image->xmpData()["Xmp.xmp.Rating"] = std::to_string(photo.scene.rating);
   image->writeMetadata();
 }
 
