@@ -97,4 +97,24 @@ class MemoryPressureSource {
   virtual void cancel() = 0;
 };
 
+// The delivery half of an event source, for implementations of it: whoever notices the event calls
+// raise, and the handler is called once for each on the queue, unless the source is stopped by
+// then. Any thread.
+class DispatchSource final : public MemoryPressureSource {
+ public:
+  explicit DispatchSource(DispatchQueuePtr queue);
+  ~DispatchSource() override;
+  void setEventHandler(Block handler) override;
+  void resume() override;
+  void cancel() override;
+  // Queues one event; nothing happens unless the source has been resumed and not cancelled.
+  void raise();
+  bool isListening() const;
+
+ private:
+  struct State;
+  std::shared_ptr<State> state_;
+  DispatchQueuePtr queue_;
+};
+
 }  // namespace kx

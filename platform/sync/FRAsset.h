@@ -29,7 +29,7 @@ class FRAsset {
   bool isRestore() const { return isRestore_; }
   void setIsRestore(bool isRestore) { isRestore_ = isRestore; }
 
-  // `<FRAsset: identifier (dataclass), name: prettyName, path: path>`, " restore" added for one.
+  // `<FRAsset: identifier (dataclass), name: prettyName, path: path>`, with ", restore" for one.
   std::string description() const;
 
  private:

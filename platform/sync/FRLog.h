@@ -84,7 +84,8 @@ class LogArgument {
   LogArgument(const ErrorPtr& error);                   // NOLINT
   LogArgument(Renderer renderer);                       // NOLINT
   LogArgument(const void* pointer);                     // NOLINT: for %p
-  // Any object with description(); a null pointer prints as (null). The object is used at once.
+  // Any object with description(); a null pointer prints as (null). The object is rendered with the
+  // message.
   template <typename T>
   LogArgument(const std::shared_ptr<T>& object)  // NOLINT
       : LogArgument(Renderer([&object](std::string& out, std::size_t) {
@@ -119,6 +120,9 @@ LogArgument::Renderer describeList(const Range& range) {
 // The message is cut at limits::kLogLineBytes; control bytes other than line breaks are escaped.
 void writeLog(const LogSite& site, LogLevel level, const char* format,
               std::initializer_list<LogArgument> arguments);
+// To the sync log alone, whatever the library's log takes.
+void writeSyncLog(const LogSite& site, LogLevel level, const char* format,
+                  std::initializer_list<LogArgument> arguments);
 std::string formatMessage(const char* format, std::initializer_list<LogArgument> arguments);
 // To the process's standard log alone.
 void writeStandardLog(const char* format, std::initializer_list<LogArgument> arguments);
