@@ -9,6 +9,9 @@
 #include <string>
 #include <vector>
 
+#include "device/DeviceAdmin.h"
+#include "device/DeviceRoot.h"
+#include "device/MediaStore.h"
 #include "platform/Platform.h"
 
 namespace kx {
@@ -86,13 +89,22 @@ struct DeviceOptions {
   bool create = false;    // make it, and the library, when missing
   bool readOnly = false;  // for status, dump and metrics: takes no lock, changes nothing
   LogSinks logs;
-  Clock* clock = nullptr;  // null: the real one; must outlive the device
+  Clock* clock = nullptr;             // null: the real one; must outlive the device
+  MediaStoreDecorator decorateMedia;  // null: the media store as it is
+  std::size_t filesPerFolder = 1000;  // of the synced-assets directory
+};
+
+// What the library has done since the last call.
+struct DeviceCounters {
+  std::uint64_t statements = 0;   // SQL statements run
+  std::uint64_t rowsWritten = 0;  // rows inserted, updated or deleted
+  std::uint64_t listSorts = 0;    // album lists that were reordered
 };
 
 // The reference device: a photo library on SQLite with its asset daemon quarryd and real files, all
-// beneath one directory. Opening for writing takes the device's lock (an error names the holder's
-// pid), recovers from an unclean stop and starts quarryd; destruction ends quarryd and closes.
-// Threads: open and destroy on one thread; accessors from any.
+// beneath one directory (its paths: DeviceLayout.h). Opening for writing takes the device's lock
+// (an error names the holder's pid), recovers from an unclean stop and starts quarryd; destruction
+// ends quarryd and closes. Threads: open and destroy on one thread; accessors from any.
 class ReferenceDevice {
  public:
   // Null and an error. Domain "com.veltro.kxdevice"; see the codes below.
@@ -102,6 +114,9 @@ class ReferenceDevice {
   virtual Platform& platform() = 0;
   virtual DeviceHealth& health() = 0;
   virtual LibraryChanges takeChanges() = 0;  // since the last call
+  virtual DeviceCounters takeCounters() = 0;
+  virtual DeviceAdmin& admin() = 0;
+  virtual DeviceRoot& root() = 0;
   // Waits until quarryd and the library's queue have nothing to do.
   virtual void drain() = 0;
   // One consistent reading; works in a read-only device too. `hash` adds SHA-256 of the files.
