@@ -20,7 +20,8 @@ inline constexpr const char* kRestoreContext =
     "/var/mobile/Media/PhotoData/Caches/restoreContext.plist";
 inline constexpr const char* kSync = "/var/mobile/Media/Photos/Sync";
 inline constexpr const char* kSnapshot = "/var/mobile/Media/Photos/Sync/PhotoLibrary.plist";
-inline constexpr const char* kLastSynced = "/var/mobile/Media/Photos/Sync/.lastsynced";
+inline constexpr const char* kLastSynced =
+    "/var/mobile/Media/Photos/Sync/PhotoLibrary.plist.lastsynced";
 inline constexpr const char* kCurrentLibraryUUID =
     "/var/mobile/Media/Photos/Sync/CurrentLibraryUUID.plist";
 // Transferred files until quarryd takes them; on the same file system as kSyncedAssets.
