@@ -1,0 +1,71 @@
+#pragma once
+
+#include <array>
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <span>
+#include <string_view>
+
+#include "platform/foundation/Value.h"
+
+namespace kx {
+
+// One field of a record class: its key in the property list and its slot.
+struct FieldKey {
+  std::string_view key;
+  std::uint8_t slot;
+};
+
+// The field values of one record. Until a field is set they are read where they stand, in the
+// property list that the record was made from: a record then costs a handle and one byte a field.
+// Any number of threads may read; setting needs the record alone.
+class RecordFields {
+ public:
+  static constexpr std::size_t kSlots = 16;
+  static constexpr std::uint8_t kAbsent = 0xFF;
+  // By slot: the position of the entry in the dictionary, or kAbsent.
+  using Positions = std::array<std::uint8_t, kSlots>;
+  static constexpr Positions kNowhere = {kAbsent, kAbsent, kAbsent, kAbsent, kAbsent, kAbsent,
+                                         kAbsent, kAbsent, kAbsent, kAbsent, kAbsent, kAbsent,
+                                         kAbsent, kAbsent, kAbsent, kAbsent};
+
+  RecordFields() = default;
+  // Null gives null fields. Anything else that is no dictionary raises TypeError naming `what`.
+  RecordFields(const Value& dictionary, std::span<const FieldKey> keys, std::string_view what);
+  // Positions found before in a dictionary with the same keys in the same order.
+  RecordFields(const Value& dictionary, const Positions& positions)
+      : dictionary_(dictionary), positions_(positions) {}
+
+  // Finds the keys; false when one stands too far behind for a position.
+  static bool findPositions(const DictionaryView& view, std::span<const FieldKey> keys,
+                            Positions& positions);
+
+  Value value(std::size_t slot) const;
+  bool isNull(std::size_t slot) const;
+  // Readings that raise TypeError naming `key`; null stays null. Views live as long as the field.
+  OptionalString string(std::size_t slot, std::string_view key) const;
+  std::optional<Number> number(std::size_t slot, std::string_view key) const;
+  // Elements of an array; 0 for everything else.
+  std::size_t count(std::size_t slot) const;
+  // Whether two slots were read from one and the same entry.
+  bool sharesEntry(std::size_t slot, std::size_t other) const;
+
+  void set(std::size_t slot, Value value);
+  // Reads `slot` from the entry of `other` when it has none of its own.
+  void fallBack(std::size_t slot, std::size_t other);
+
+  // Null-tolerant equality of one slot in two records: both null, or equal values. Never raises.
+  static bool equal(const RecordFields& a, const RecordFields& b, std::size_t slot);
+
+ private:
+  using Values = std::array<Value, kSlots>;
+  void detach();
+
+  Value dictionary_;
+  Positions positions_ = kNowhere;
+  std::unique_ptr<Values> values_;  // all fields, once one was set
+};
+
+}  // namespace kx
