@@ -7,7 +7,8 @@ namespace kx {
 
 // A property-list number. Keeps apart how it was written (boolean, integer, unsigned beyond int64,
 // single- or double-precision real), so that writing it again gives the same bytes; equality is
-// numeric across all of them (true == 1 == 1.0) and exact: no integer is rounded to compare it.
+// numeric across all of them (true == 1 == 1.0) and exact: no integer is rounded to compare it. NaN
+// equals NaN, so that equality is an equivalence.
 // Plain value, safe to copy between threads.
 class Number {
  public:
@@ -23,7 +24,8 @@ class Number {
   Type type() const { return type_; }
   bool isReal() const { return type_ == Type::kReal32 || type_ == Type::kReal64; }
 
-  // Conversions read the value in another type. Reals are truncated towards zero and saturate;
+  // Conversions read the value in another type. Reals are truncated towards zero and saturate (a
+  // negative real reads unsigned as its 64-bit two's complement, as a negative integer does);
   // NaN reads as 0. int32Value and int16Value take the low bits of the 64-bit integer reading.
   bool boolValue() const;
   std::int64_t int64Value() const;
@@ -38,6 +40,8 @@ class Number {
   friend bool operator==(const Number& a, const Number& b);
 
  private:
+  friend class Value;
+  friend struct ValueAccess;
   Number(Type type, std::uint64_t bits) : type_(type), bits_(bits) {}
 
   Type type_;

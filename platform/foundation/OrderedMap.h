@@ -3,12 +3,12 @@
 #include <algorithm>
 #include <cstddef>
 #include <cstdint>
-#include <functional>
 #include <string_view>
 #include <type_traits>
 #include <utility>
 #include <vector>
 
+#include "platform/foundation/Hash.h"
 #include "platform/foundation/Value.h"
 
 namespace kx {
@@ -35,6 +35,7 @@ class OrderedMap {
     entries_.clear();
     slots_.clear();
     live_ = 0;
+    first_ = 0;
   }
 
   T* find(std::string_view key) {
@@ -55,7 +56,9 @@ class OrderedMap {
       entry.value = std::move(value);
       return entry.value;
     }
-    if ((entries_.size() + 1) * 2 > slots_.size()) rehash(entries_.size() + 1);
+    // Removed entries keep their place and their slot until the next rehash, so they count here: at
+    // most half of the slots are ever taken and every probe meets a free one.
+    if ((entries_.size() + 1) * 2 > slots_.size()) rehash(live_ + 1);
     entries_.push_back(Entry{key, std::move(value)});
     link(entries_.size() - 1);
     ++live_;
@@ -71,6 +74,7 @@ class OrderedMap {
     entry.value = T();
     slots_[slot] = kTombstone;
     --live_;
+    while (first_ < entries_.size() && entries_[first_].key.isNull()) ++first_;
     return true;
   }
 
@@ -97,16 +101,18 @@ class OrderedMap {
   };
   using iterator = BasicIterator<false>;
   using const_iterator = BasicIterator<true>;
-  iterator begin() { return {this, 0}; }
+  iterator begin() { return {this, first_}; }
   iterator end() { return {this, entries_.size()}; }
-  const_iterator begin() const { return {this, 0}; }
+  const_iterator begin() const { return {this, first_}; }
   const_iterator end() const { return {this, entries_.size()}; }
 
  private:
   static constexpr std::size_t kNone = static_cast<std::size_t>(-1);
   static constexpr std::uint32_t kTombstone = static_cast<std::uint32_t>(-1);
 
-  static std::size_t hashOf(std::string_view key) { return std::hash<std::string_view>{}(key); }
+  static std::size_t hashOf(std::string_view key) {
+    return static_cast<std::size_t>(hashText(key));
+  }
 
   std::size_t findSlot(std::string_view key) const {
     if (slots_.empty()) return kNone;
@@ -123,16 +129,15 @@ class OrderedMap {
     while (slots_[slot] != 0) slot = (slot + 1) & mask;
     slots_[slot] = static_cast<std::uint32_t>(index + 1);
   }
-  // Drops the places of removed entries and builds the table anew with room for `count` entries.
+  // Drops the places of removed entries and builds the table anew with room for twice `count`
+  // entries: at least `count` further insertions go by before the next time.
   void rehash(std::size_t count) {
-    std::vector<Entry> kept;
-    kept.reserve(std::max(count, live_));
-    for (Entry& entry : entries_) {
-      if (!entry.key.isNull()) kept.push_back(std::move(entry));
+    if (live_ != entries_.size()) {
+      std::erase_if(entries_, [](const Entry& entry) { return entry.key.isNull(); });
     }
-    entries_ = std::move(kept);
     std::size_t capacity = 16;
-    while (capacity < std::max(count, entries_.size()) * 4) capacity *= 2;
+    while (capacity < std::max(count, live_) * 4) capacity *= 2;
+    first_ = 0;
     slots_.assign(capacity, 0);
     for (std::size_t i = 0; i < entries_.size(); ++i) link(i);
   }
@@ -140,6 +145,7 @@ class OrderedMap {
   std::vector<Entry> entries_;
   std::vector<std::uint32_t> slots_;  // index into entries_ plus 1; 0 is free
   std::size_t live_ = 0;
+  std::size_t first_ = 0;  // no entry before it is live
 };
 
 }  // namespace kx

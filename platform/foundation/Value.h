@@ -1,5 +1,6 @@
 #pragma once
 
+#include <atomic>
 #include <cstddef>
 #include <cstdint>
 #include <initializer_list>
@@ -18,9 +19,10 @@ namespace kx {
 
 class ArrayView;
 class Dictionary;
+class DictionaryContent;
 class DictionaryView;
 class Value;
-class ValueStorage;
+struct ValueAccess;
 
 using Array = std::vector<Value>;
 
@@ -41,6 +43,37 @@ enum class Kind : std::uint8_t {
 // "null", "number", "date", "string", "data", "uid", "array", "dictionary".
 std::string_view kindName(Kind kind);
 
+// Counted storage behind values: text or data, an array, a dictionary, or a whole document.
+// Internal: its kinds are in ValueStorage.h. Releasing the last reference never recurses over
+// nested storage.
+class ValueStorage {
+ public:
+  enum class Type : std::uint8_t { kBytes, kArray, kDictionary, kDocument };
+  ValueStorage(const ValueStorage&) = delete;
+  ValueStorage& operator=(const ValueStorage&) = delete;
+
+  Type type() const noexcept { return type_; }
+  void retain() const noexcept { references_.fetch_add(1, std::memory_order_relaxed); }
+  void release() const noexcept {
+    if (dropReference()) destroy(this);
+  }
+
+ protected:
+  explicit ValueStorage(Type type) noexcept : type_(type) {}
+  ~ValueStorage() = default;
+
+ private:
+  bool dropReference() const noexcept {
+    return references_.fetch_sub(1, std::memory_order_acq_rel) == 1;
+  }
+  static void destroy(const ValueStorage* storage) noexcept;
+  static void destroyOne(const ValueStorage* storage) noexcept;
+
+  mutable std::atomic<std::uint32_t> references_{1};
+  const Type type_;
+  mutable const ValueStorage* nextToDestroy_ = nullptr;
+};
+
 // One immutable property-list value, or null (which no property list holds: it stands for an absent
 // value). A value read from a file is a handle into its document: strings, data and containers stay
 // views of the document's bytes, which live as long as any value made from it. Copying costs at
@@ -50,13 +83,25 @@ std::string_view kindName(Kind kind);
 class Value {
  public:
   Value() noexcept = default;
-  Value(const Value& other) noexcept;
-  Value(Value&& other) noexcept;
-  Value& operator=(const Value& other) noexcept;
-  Value& operator=(Value&& other) noexcept;
-  ~Value();
+  Value(const Value& other) noexcept { copyFrom(other); }
+  Value(Value&& other) noexcept { takeFrom(other); }
+  Value& operator=(const Value& other) noexcept {
+    if (this != &other) {
+      Value copy(other);
+      swap(copy);
+    }
+    return *this;
+  }
+  Value& operator=(Value&& other) noexcept {
+    Value taken(std::move(other));
+    swap(taken);
+    return *this;
+  }
+  ~Value() {
+    if (owner_ != nullptr) owner_->release();
+  }
 
-  Value(const Number& number);  // NOLINT: a number is a value
+  Value(const Number& number) noexcept;  // NOLINT: a number is a value
   static Value boolean(bool value) { return Value(Number::boolean(value)); }
   static Value integer(std::int64_t value) { return Value(Number::integer(value)); }
   static Value unsignedInteger(std::uint64_t value) {
@@ -105,28 +150,53 @@ class Value {
   friend bool operator==(const Value& a, const Value& b);
 
   // Readable text for logs: strings bare at the top level and quoted inside containers, containers
-  // over several lines, null as "(null)".
+  // over several lines, null as "(null)". Cut with "..." after about 1 MiB.
   std::string description() const;
 
  private:
-  friend class ArrayView;
-  friend class Dictionary;
-  friend class DictionaryView;
-  friend class PropertyListDocument;
   friend class ValueStorage;
+  friend struct ValueAccess;
+
+  void copyFrom(const Value& other) noexcept {
+    owner_ = other.owner_;
+    payload_ = other.payload_;
+    size_ = other.size_;
+    kind_ = other.kind_;
+    numberType_ = other.numberType_;
+    inDocument_ = other.inDocument_;
+    if (owner_ != nullptr) owner_->retain();
+  }
+  void takeFrom(Value& other) noexcept {
+    owner_ = std::exchange(other.owner_, nullptr);
+    payload_ = other.payload_;
+    size_ = other.size_;
+    kind_ = std::exchange(other.kind_, Kind::kNull);
+    numberType_ = other.numberType_;
+    inDocument_ = other.inDocument_;
+  }
+  void swap(Value& other) noexcept {
+    std::swap(owner_, other.owner_);
+    std::swap(payload_, other.payload_);
+    std::swap(size_, other.size_);
+    std::swap(kind_, other.kind_);
+    std::swap(numberType_, other.numberType_);
+    std::swap(inDocument_, other.inDocument_);
+  }
 
   union Payload {
-    std::uint64_t bits;   // number, date (bits of the double), uid
-    const char* text;     // string, data: length in size_
-    std::uint64_t index;  // container inside a document: its object index
+    std::uint64_t bits;   // number, date (bits of the double), uid; container: its object index
+    const void* pointer;  // string, data
   };
 
   const ValueStorage* owner_ = nullptr;  // counted; null for numbers, dates, uids
   Payload payload_{0};
-  std::uint32_t size_ = 0;
+  std::uint32_t size_ = 0;  // bytes of a string or data, elements of a container
   Kind kind_ = Kind::kNull;
   Number::Type numberType_ = Number::Type::kInteger;
+  bool inDocument_ = false;  // owner_ is a document
 };
+
+static_assert(sizeof(Value) <= 24);
 
 // Read access to an array value. Keeps the underlying storage alive.
 class ArrayView {
@@ -184,7 +254,8 @@ class DictionaryView {
 };
 
 // A dictionary being built: string keys, order of insertion; setting a key again keeps its place.
-// Setting a null value raises InternalInconsistency. Not for use from two threads at once.
+// Setting a null value raises InternalInconsistency. Removal costs a move of the later entries, all
+// else O(1) on average. Not for use from two threads at once.
 class Dictionary {
  public:
   Dictionary();
@@ -209,8 +280,7 @@ class Dictionary {
 
  private:
   friend class Value;
-  struct Content;
-  std::unique_ptr<Content> content_;
+  std::unique_ptr<DictionaryContent> content_;
 };
 
 }  // namespace kx
