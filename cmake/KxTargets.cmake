@@ -79,7 +79,8 @@ function(kx_test folder)
   endif()
   set(target test_${folder})
   add_executable(${target} ${sources})
-  target_link_libraries(${target} PRIVATE kx_options ${arg_LIBRARIES} kx_testing rapidcheck
+  target_link_libraries(${target} PRIVATE kx_options kx_test_support ${arg_LIBRARIES} kx_testing
+                        rapidcheck
                         GTest::gmock_main GTest::gmock GTest::gtest)
   target_compile_definitions(${target} PRIVATE
     KX_TEST_SOURCE_DIR="${PROJECT_SOURCE_DIR}"
@@ -112,4 +113,18 @@ function(kx_test folder)
   file(WRITE ${labels} "if(${target}_CONCURRENCY)\n  set_tests_properties(\${${target}_CONCURRENCY}"
                        " PROPERTIES LABELS \"${folder};concurrency\")\nendif()\n")
   set_property(DIRECTORY APPEND PROPERTY TEST_INCLUDE_FILES ${labels})
+endfunction()
+
+# kx_python_test(FOLDER): each tests/FOLDER/*_test.py, test_*.py or *Test.py is an entry of ctest,
+# "FOLDER.<name>". KX_BIN names the directory of the programs, KX_MAKE_SAMPLE the sample's maker.
+function(kx_python_test folder)
+  set(here ${PROJECT_SOURCE_DIR}/tests/${folder})
+  file(GLOB scripts CONFIGURE_DEPENDS ${here}/*_test.py ${here}/test_*.py ${here}/*Test.py)
+  foreach(script IN LISTS scripts)
+    get_filename_component(name ${script} NAME_WE)
+    add_test(NAME ${folder}.${name} COMMAND ${Python3_EXECUTABLE} -B ${script})
+    set_tests_properties(${folder}.${name} PROPERTIES LABELS ${folder} TIMEOUT 900
+      WORKING_DIRECTORY ${here}
+      ENVIRONMENT "KX_BIN=${CMAKE_RUNTIME_OUTPUT_DIRECTORY};KX_MAKE_SAMPLE=$<TARGET_FILE:make-sample-library>")
+  endforeach()
 endfunction()

@@ -69,6 +69,12 @@ def banned_calls(path, code):
             yield path, source_tree.line_of(code, match.start()), f"{what} is banned: {instead}"
 
 
+def sleeping_script(path, text):
+    for match in re.finditer(r"\btime\.sle" r"ep\s*\(", text):
+        yield path, source_tree.line_of(text, match.start()), \
+            "sleeping is banned: wait for the event itself"
+
+
 def left_over(path, text):
     for number, line in enumerate(text.splitlines(), 1):
         if path.endswith(MARKED_FILES) and MARKS.search(line.replace(MARK_ALLOWED, "")):
@@ -128,6 +134,9 @@ def violations(root):
             yield from function_budget(path, code)
             yield from banned_calls(path, code)
             yield from empty_test(path, code)
+        if path.endswith(".py"):
+            yield from file_budget(path, text)
+            yield from sleeping_script(path, text)
         if path.endswith(".md"):
             yield from document_paths(root, path, text, known)
 

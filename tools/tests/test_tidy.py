@@ -64,6 +64,10 @@ class Tidy(PlantedTree):
                 self.plant("tests/client/ATest.cpp", f"TEST(A, B) {{ {call}; }}\n")
                 self.assert_red("sleeping is banned")
 
+    def test_sleeping_script(self):
+        self.plant("tests/e2e/a_test.py", "import time\ntime.sle" "ep(1)\n")
+        self.assert_red("tests/e2e/a_test.py:2: sleeping is banned")
+
     def test_reading_a_clock(self):
         for call in ("std::chrono::system_clock::now()", "time(nullptr)", "clock_gettime(0, &t)",
                      "gettimeofday(&t, nullptr)", "std::chrono::steady_clock::now()"):
