@@ -37,6 +37,8 @@ class Error {
 using ErrorPtr = std::shared_ptr<const Error>;
 
 inline constexpr const char* kErrorMessageKey = "message";
+// What an error came from: a dictionary with the "domain" and "code" of that error.
+inline constexpr const char* kUnderlyingErrorKey = "underlyingError";
 // POSIX errors carry errno as their code.
 inline constexpr const char* kPosixErrorDomain = "POSIX";
 

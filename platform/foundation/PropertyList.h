@@ -8,6 +8,7 @@
 
 #include "platform/foundation/Data.h"
 #include "platform/foundation/Error.h"
+#include "platform/foundation/Limits.h"
 #include "platform/foundation/Value.h"
 
 namespace kx {
@@ -20,7 +21,7 @@ namespace kx {
 // value).
 inline constexpr const char* kPropertyListErrorDomain = "com.veltro.plist";
 
-// Codes; names in messages are the enumerators without the k, in capitals (E_PLIST_MAGIC, ...).
+// Codes; the message begins with the code's name, see propertyListErrorName.
 enum class PropertyListError : std::int64_t {
   kIo = 1,     // the file could not be read (message names the system error)
   kMagic = 2,  // empty, too short, unknown magic or version: no property list
@@ -48,16 +49,38 @@ enum class PropertyListError : std::int64_t {
   kWrite = 24,  // a value that no property list can hold (null, invalid text)
 };
 
+// "E_PLIST_MAGIC", "E_TEXT_ENCODING", "E_XML_DTD", "E_ARCHIVE_CYCLE", ...
+std::string_view propertyListErrorName(PropertyListError code);
+
+// What a reading accepts at most; the values of Limits.h unless a caller wants less.
+struct PropertyListLimits {
+  std::uint64_t fileBytes = limits::kSnapshotFileBytes;
+  std::uint64_t objects = limits::kObjects;
+  std::size_t nestingDepth = limits::kNestingDepth;  // containers around a value, itself included
+  std::uint64_t visits = limits::kVisits;
+  std::size_t stringBytes = limits::kStringBytes;  // as UTF-8
+  std::size_t keyUnits = limits::kKeyUnits;
+  std::size_t dataBytes = limits::kDataBytes;
+  std::uint64_t decodeBaseBytes = limits::kDecodeBaseBytes;
+  std::size_t xmlTextBytes = limits::kXmlTextBytes;
+  std::size_t xmlNameBytes = limits::kXmlNameBytes;
+  std::size_t xmlAttributes = limits::kXmlAttributes;
+};
+
 // Finds the format by itself, checks the whole input before anything is returned, and never
 // recurses over its depth. The bytes are shared with the values read. Null and an error when it is
 // malformed.
 Value readPropertyList(DataPtr bytes, ErrorPtr* error);
+Value readPropertyList(DataPtr bytes, const PropertyListLimits& limits, ErrorPtr* error);
 
 enum class PropertyListFormat { kBinary, kXml };
 
-// The written bytes; equal strings and numbers are written once (binary). Reals keep their width,
-// integers take the smallest width that holds them. Empty and an error when the value holds a null
-// or text that is not valid UTF-8.
+// The written bytes; equal strings, numbers, dates and data are written once (binary), and so is a
+// container that occurs several times. Reals keep their width, integers take the smallest width
+// that holds them. Whatever is written can be read again: empty and an error when the value holds a
+// null, text that is not UTF-8 or holds a NUL, a date out of range, or more than the limits of
+// reading. XML has no form for UIDs and control characters (errors) nor for fractions of a second
+// (dropped).
 std::vector<std::uint8_t> writePropertyList(const Value& root, PropertyListFormat format,
                                             ErrorPtr* error);
 

@@ -51,7 +51,7 @@ Value PropertyListDocument::valueAt(std::uint32_t object) const {
 
 std::uint32_t PropertyListDocument::keyNumber(std::string_view text) const {
   if (keySlots_.empty()) return kNoKey;
-  const std::uint64_t hash = hashBytes(text.data(), text.size(), seed_);
+  const auto hash = static_cast<std::uint32_t>(hashBytes(text.data(), text.size(), seed_));
   const std::size_t mask = keySlots_.size() - 1;
   for (std::size_t slot = hash & mask; keySlots_[slot] != 0; slot = (slot + 1) & mask) {
     const std::uint32_t number = keySlots_[slot] - 1;
@@ -64,7 +64,7 @@ std::uint32_t PropertyListDocument::keyNumber(std::string_view text) const {
 std::uint32_t PropertyListDocument::internKey(std::uint32_t object) {
   if ((keys_.size() + 1) * 2 > keySlots_.size()) growKeyTable();
   const std::string_view text = this->text(nodes_[object]);
-  const std::uint64_t hash = hashBytes(text.data(), text.size(), seed_);
+  const auto hash = static_cast<std::uint32_t>(hashBytes(text.data(), text.size(), seed_));
   const std::size_t mask = keySlots_.size() - 1;
   std::size_t slot = hash & mask;
   for (; keySlots_[slot] != 0; slot = (slot + 1) & mask) {

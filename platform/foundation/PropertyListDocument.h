@@ -94,6 +94,14 @@ class PropertyListDocument final : public ValueStorage {
     return static_cast<std::uint32_t>(
         loadBig(base_ + node.low + position * referenceSize_, referenceSize_));
   }
+  // The first `count` references of a container as they are stored. Within one document equal bytes
+  // are equal references.
+  std::string_view referenceBytes(const DocumentNode& node, std::size_t count) const {
+    if (referenceSize_ == 0) {
+      return {reinterpret_cast<const char*>(&references_[node.low]), count * sizeof(std::uint32_t)};
+    }
+    return {reinterpret_cast<const char*>(base_) + node.low, count * referenceSize_};
+  }
   // Position of a key in a dictionary, or kNone.
   std::size_t positionOf(std::uint32_t object, std::string_view key) const;
   static constexpr std::size_t kNone = static_cast<std::size_t>(-1);
@@ -135,7 +143,7 @@ class PropertyListDocument final : public ValueStorage {
   DocumentArena arena_;
 
   struct Key {
-    std::uint64_t hash;
+    std::uint32_t hash;  // its low bits
     std::uint32_t object;
   };
   const HashSeed seed_;

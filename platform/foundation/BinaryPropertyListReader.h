@@ -1,0 +1,88 @@
+#pragma once
+
+#include <array>
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "platform/foundation/PropertyList.h"
+#include "platform/foundation/PropertyListDocument.h"
+#include "platform/foundation/PropertyListFailure.h"
+
+namespace kx {
+
+// Reads a binary property list into a document, in one walk from the root: an object is read when
+// the first reference to it is met, so errors come in document order. Objects that nothing refers
+// to are read at the end. Time is linear in the file: each object is read once, and objects that
+// overlap are refused. Internal to platform/foundation; throws PropertyListFailure.
+class BinaryPropertyListReader {
+ public:
+  BinaryPropertyListReader(DataPtr bytes, const PropertyListLimits& limits);
+  Value read();
+
+  static bool isBinary(const std::uint8_t* bytes, std::size_t length);
+
+ private:
+  // A container that is being walked.
+  struct Frame {
+    std::uint32_t object;
+    std::uint32_t next;
+    std::uint32_t count;
+    std::uint32_t visits;
+    const std::uint8_t* values;  // the references to its elements
+    std::uint8_t height;         // of the highest element so far
+  };
+  struct Length {
+    std::uint64_t count;
+    std::size_t contentOffset;
+  };
+
+  [[noreturn]] void fail(PropertyListError code, std::string what, std::uint64_t offset) const;
+  std::string path() const;
+
+  void readTrailer();
+  std::uint64_t offsetOf(std::uint32_t object) const;
+  // Reads the object's own bytes into its node.
+  void readObject(std::uint32_t object);
+  void readScalar(DocumentNode& node, std::size_t offset, unsigned marker);
+  void readInteger(DocumentNode& node, std::size_t offset, unsigned marker);
+  void readWideInteger(DocumentNode& node, std::size_t offset);
+  void readDate(DocumentNode& node, std::size_t offset);
+  void readUid(DocumentNode& node, std::size_t offset, unsigned marker);
+  void readData(DocumentNode& node, std::size_t offset, unsigned marker);
+  void readAscii(DocumentNode& node, std::size_t offset, unsigned marker);
+  void readUtf16(DocumentNode& node, std::size_t offset, unsigned marker);
+  void readContainer(DocumentNode& node, std::size_t offset, unsigned marker);
+  Length readLength(std::size_t offset, unsigned marker, unsigned unitBytes);
+  // Counts the bytes of an object: together they never exceed the bytes that hold objects.
+  void claim(std::size_t offset, std::size_t end);
+  void requireFixed(std::size_t offset, std::size_t size);
+
+  std::uint32_t referenceAt(const std::uint8_t* place) const;
+  void walk(std::uint32_t root);
+  void enter(std::uint32_t object);
+  void checkKeys(const Frame& frame);
+  void advance(Frame& frame);
+  void visitContainer(Frame& frame, std::uint32_t object, const std::uint8_t* place);
+  void leave();
+  void readUnreferenced();
+
+  const PropertyListLimits limits_;
+  PropertyListDocument* document_;  // owned by keeper_
+  Value keeper_;
+  const std::uint8_t* base_;
+  std::size_t length_;
+  unsigned offsetSize_ = 0;
+  unsigned referenceSize_ = 0;
+  std::uint32_t count_ = 0;
+  std::uint32_t root_ = 0;
+  std::size_t tableStart_ = 0;
+  std::size_t claimed_ = 0;
+  std::uint64_t readCount_ = 0;
+  DocumentNode* nodes_ = nullptr;
+  std::vector<Frame> stack_;
+  std::vector<std::uint32_t> lastDictionaryOfKey_;  // object plus 1, by key number
+  std::vector<std::uint32_t> largeDictionaries_;
+};
+
+}  // namespace kx

@@ -1,0 +1,65 @@
+#pragma once
+
+#include <cstddef>
+#include <optional>
+#include <string_view>
+
+#include "platform/foundation/PropertyListDocument.h"
+#include "platform/foundation/Value.h"
+#include "platform/foundation/ValueStorage.h"
+
+namespace kx {
+
+// A look at the entries of a dictionary or array that was read from a file, where they stand: no
+// value is made and nothing is counted, so what is seen lives as long as the container's value
+// does. For loops over very many records; Value and its views say the same of any value. Any
+// thread.
+class EntryPeek {
+ public:
+  // Whether entries of the value can be looked at: a dictionary or array read from a file.
+  static bool can(const Value& container) {
+    return ValueAccess::inDocument(container) && (container.isDictionary() || container.isArray());
+  }
+
+  // The value of the position-th entry of a dictionary.
+  static EntryPeek valueOf(const Value& dictionary, std::size_t position) {
+    const PropertyListDocument* document = documentOf(dictionary);
+    const DocumentNode& node = document->node(ValueAccess::objectIndex(dictionary));
+    const std::size_t count = ValueAccess::size(dictionary);
+    return EntryPeek(*document, document->node(document->reference(node, count + position)));
+  }
+  // The index-th element of an array.
+  static EntryPeek elementOf(const Value& array, std::size_t index) {
+    const PropertyListDocument* document = documentOf(array);
+    const DocumentNode& node = document->node(ValueAccess::objectIndex(array));
+    return EntryPeek(*document, document->node(document->reference(node, index)));
+  }
+  // Bytes that are equal for two dictionaries of one document exactly when they hold the same key
+  // objects in the same order.
+  static std::string_view keyBytes(const Value& dictionary) {
+    const PropertyListDocument* document = documentOf(dictionary);
+    return document->referenceBytes(document->node(ValueAccess::objectIndex(dictionary)),
+                                    ValueAccess::size(dictionary));
+  }
+
+  Kind kind() const { return node_.kind; }
+  // Of a value of that kind.
+  std::string_view text() const { return document_.text(node_); }
+  Number number() const {
+    return ValueAccess::number(static_cast<Number::Type>(node_.detail), node_.bits());
+  }
+  // Elements of an array, entries of a dictionary.
+  std::size_t count() const { return node_.high; }
+
+ private:
+  static const PropertyListDocument* documentOf(const Value& container) {
+    return static_cast<const PropertyListDocument*>(ValueAccess::owner(container));
+  }
+  EntryPeek(const PropertyListDocument& document, const DocumentNode& node)
+      : document_(document), node_(node) {}
+
+  const PropertyListDocument& document_;
+  const DocumentNode& node_;
+};
+
+}  // namespace kx
