@@ -58,6 +58,8 @@ class RecordFields {
 
   // Null-tolerant equality of one slot in two records: both null, or equal values. Never raises.
   static bool equal(const RecordFields& a, const RecordFields& b, std::size_t slot);
+  // The same of the elements of two arrays that have the same count, in their order.
+  static bool equalElements(const RecordFields& a, const RecordFields& b, std::size_t slot);
 
  private:
   using Values = std::array<Value, kSlots>;

@@ -21,6 +21,9 @@ class EntryPeek {
     return ValueAccess::inDocument(container) && (container.isDictionary() || container.isArray());
   }
 
+  // Names the file that a container was read from, as long as the container's value lives.
+  static const void* document(const Value& container) { return documentOf(container); }
+
   // The value of the position-th entry of a dictionary.
   static EntryPeek valueOf(const Value& dictionary, std::size_t position) {
     const PropertyListDocument* document = documentOf(dictionary);

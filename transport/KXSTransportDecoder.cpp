@@ -1,0 +1,186 @@
+#include "transport/KXSTransportDecoder.h"
+
+#include <algorithm>
+
+#include "platform/foundation/EntryPeek.h"
+#include "platform/foundation/Limits.h"
+#include "platform/foundation/PropertyList.h"
+#include "platform/foundation/Text.h"
+#include "transport/RecordLayouts.h"
+
+namespace kx {
+namespace {
+
+enum class ItemClass { kAlbum, kAsset, kEvent };
+
+struct ClassifiedItem {
+  ItemClass itemClass;
+  KXSItemPtr item;
+};
+
+ItemClass classOfType(std::string_view itemType) {
+  if (itemType == kKXSTransportAlbumItemType) return ItemClass::kAlbum;
+  if (itemType == kKXSTransportAssetItemType) return ItemClass::kAsset;
+  if (itemType == kKXSTransportEventItemType) return ItemClass::kEvent;
+  throw UnknownObjectType();
+}
+
+ClassifiedItem plainItem(const Value& dictionary) {
+  dictionary.asDictionary("item");
+  const Value type = dictionary[kKXSTransportItemTypeKey];
+  if (!type.isString()) throw UnknownObjectType();
+  switch (classOfType(type.stringValue())) {
+    case ItemClass::kAlbum:
+      return {ItemClass::kAlbum, KXSAlbum::initFromPropertyList(dictionary)};
+    case ItemClass::kAsset:
+      return {ItemClass::kAsset, KXSAsset::initFromPropertyList(dictionary)};
+    default:
+      return {ItemClass::kEvent, KXSEvent::initFromPropertyList(dictionary)};
+  }
+}
+
+ClassifiedItem itemFromPropertyList(const Value& dictionary, RecordLayouts& layouts) {
+  const RecordLayouts::Layout* layout = layouts.find(dictionary);
+  if (layout == nullptr) return plainItem(dictionary);
+  if (layout->itemType == RecordFields::kAbsent) throw UnknownObjectType();
+  const EntryPeek type = EntryPeek::valueOf(dictionary, layout->itemType);
+  if (type.kind() != Kind::kString) throw UnknownObjectType();
+  switch (classOfType(type.text())) {
+    case ItemClass::kAlbum:
+      return {ItemClass::kAlbum, KXSAlbum::initFromPropertyList(dictionary, layout->album)};
+    case ItemClass::kAsset:
+      return {ItemClass::kAsset, KXSAsset::initFromPropertyList(dictionary, layout->asset)};
+    default:
+      return {ItemClass::kEvent, KXSEvent::initFromPropertyList(dictionary, layout->event)};
+  }
+}
+
+Value keyOf(const KXSItem& item) {
+  Value uuid = item.uuidValue();
+  if (uuid.isNull()) throw InternalInconsistency("item without \"uuid\" cannot be stored");
+  return uuid;
+}
+
+void checkCount(std::size_t count, std::uint64_t limit, std::string_view what) {
+  if (count <= limit) return;
+  throw InternalInconsistency("snapshot holds more than " + std::to_string(limit) + " " +
+                              std::string(what));
+}
+
+// The collections of one snapshot while it is decoded.
+struct Collections {
+  KXSAssetMapPtr assets = std::make_shared<KXSAssetMap>();
+  KXSItemMapPtr containers = std::make_shared<KXSItemMap>();
+  KXSItemListPtr ordered = std::make_shared<KXSItemList>();
+
+  void add(ClassifiedItem classified) {
+    Value key = keyOf(*classified.item);
+    if (classified.itemClass == ItemClass::kAsset) {
+      assets->set(key, std::static_pointer_cast<KXSAsset>(std::move(classified.item)));
+      checkCount(assets->size(), limits::kAssets, "assets");
+      return;
+    }
+    ordered->push_back(classified.item);
+    containers->set(key, std::move(classified.item));
+    checkCount(ordered->size(), limits::kContainers, "albums and events");
+  }
+};
+
+// A list can name one item very often: more room than this is made as it is needed.
+constexpr std::size_t kMostReserved = std::size_t{1} << 17;
+
+Collections decodeUpdates(const Value& root, RecordLayouts& layouts) {
+  Collections collections;
+  const auto updates = root[kKXSTransportUpdatesKey].asArray(kKXSTransportUpdatesKey);
+  if (!updates) return collections;
+  const std::size_t count = updates->size();
+  collections.assets->reserve(std::min(count, kMostReserved));
+  for (std::size_t i = 0; i < count; ++i) {
+    collections.add(itemFromPropertyList((*updates)[i], layouts));
+  }
+  return collections;
+}
+
+KXSItemMapPtr decodeDeletes(const Value& root, RecordLayouts& layouts) {
+  auto items = std::make_shared<KXSItemMap>();
+  const auto deletes = root[kKXSTransportDeletesKey].asArray(kKXSTransportDeletesKey);
+  if (!deletes) return items;
+  const std::size_t count = deletes->size();
+  for (std::size_t i = 0; i < count; ++i) {
+    KXSItemPtr item = itemFromPropertyList((*deletes)[i], layouts).item;
+    const Value key = keyOf(*item);
+    items->set(key, std::move(item));
+    checkCount(items->size(), limits::kAssets + limits::kContainers, "deletes");
+  }
+  return items;
+}
+
+OptionalString nameOf(const KXSItem& item) {
+  if (const auto* album = dynamic_cast<const KXSAlbum*>(&item)) return album->name();
+  if (const auto* event = dynamic_cast<const KXSEvent*>(&item)) return event->name();
+  return std::nullopt;
+}
+
+KXSItemListPtr sortedByName(const KXSItemList& items) {
+  struct Named {
+    OptionalString name;
+    const KXSItemPtr* item;
+  };
+  std::vector<Named> named;
+  named.reserve(items.size());
+  for (const KXSItemPtr& item : items) named.push_back(Named{nameOf(*item), &item});
+  std::stable_sort(named.begin(), named.end(),
+                   [](const Named& a, const Named& b) { return compareNames(a.name, b.name) < 0; });
+  auto sorted = std::make_shared<KXSItemList>();
+  sorted->reserve(items.size());
+  for (const Named& entry : named) sorted->push_back(*entry.item);
+  return sorted;
+}
+
+ErrorPtr readFailure(const ErrorPtr& cause) {
+  return Error::make(kPropertyListErrorDomain, static_cast<std::int64_t>(PropertyListError::kIo),
+                     "E_PLIST_IO: " + (cause ? cause->message() : std::string("cannot be read")));
+}
+
+}  // namespace
+
+KXSLibraryChangeSnapshotPtr KXSTransportDecoder::decodeSnapshotFromFile(FileSystem& files,
+                                                                        const std::string& path,
+                                                                        ErrorPtr* error) {
+  ErrorPtr cause;
+  Value root;
+  DataPtr bytes = files.readFile(path, &cause);
+  if (bytes) {
+    root = readPropertyList(std::move(bytes), error);
+  } else {
+    setError(error, readFailure(cause));
+  }
+  return decodeSnapshotFromPropertyList(root, error);
+}
+
+KXSLibraryChangeSnapshotPtr KXSTransportDecoder::decodeSnapshotFromPropertyList(
+    const Value& root, ErrorPtr* /*error*/) {
+  auto snapshot = KXSLibraryChangeSnapshot::librarySnapshot();
+  snapshot->setLibraryUUIDValue(root[kKXSTransportLibraryUUIDKey]);
+  const Value kind = root[kKXSTransportLibraryKindKey];
+  snapshot->setLibraryKindValue(kind);
+  snapshot->setIsFolderSync(kind.isString() &&
+                            kind.stringValue() == kKXSTransportLibraryKindFolderKey);
+  RecordLayouts layouts;
+  Collections collections = decodeUpdates(root, layouts);
+  snapshot->setAssetsByUUID(std::move(collections.assets));
+  snapshot->setAlbumsAndEventsByUUID(std::move(collections.containers));
+  snapshot->setOrderedAlbums(std::move(collections.ordered));
+  snapshot->setUpdates(nullptr);
+  snapshot->setDeletes(decodeDeletes(root, layouts));
+  if (snapshot->isFolderSync()) {
+    snapshot->setOrderedAlbums(sortedByName(*snapshot->orderedAlbums()));
+  }
+  return snapshot;
+}
+
+KXSItemPtr KXSTransportDecoder::_itemFromPropertyList(const Value& dictionary) {
+  return plainItem(dictionary).item;
+}
+
+}  // namespace kx
