@@ -1,0 +1,351 @@
+#include "daemon/SyncSession.h"
+
+#include <algorithm>
+#include <csignal>
+
+#include "daemon/TransferLoop.h"
+#include "platform/foundation/Text.h"
+
+namespace kx {
+namespace {
+
+// The plug-in only logs the type; 1 stands for a sync that the user asked for.
+constexpr std::uint32_t kSyncType = 1;
+constexpr const char* kAnchor = "1";
+
+ErrorPtr syncError(SyncErrorCode code, const std::string& message) {
+  return Error::make(kSyncErrorDomain, static_cast<std::int64_t>(code),
+                     escapeControlCharacters(message));
+}
+
+ErrorPtr prefixed(const std::string& prefix, const Error& error) {
+  const std::string text = error.message().empty() ? error.description() : error.message();
+  return Error::make(error.domain(), error.code(), escapeControlCharacters(prefix + ": " + text));
+}
+
+bool hasNeededOperations(const FRClient& client) {
+  constexpr FROperation kNeeded[] = {
+      FROperation::kPrepareForSyncWithHostAnchor,  FROperation::kReconcileSync,
+      FROperation::kOutstandingAssetTransfers,     FROperation::kAssetTransfer,
+      FROperation::kAssetTransferEndedWithSuccess, FROperation::kSyncEndedWithSuccess,
+  };
+  return std::all_of(std::begin(kNeeded), std::end(kNeeded),
+                     [&](FROperation operation) { return client.respondsTo(operation); });
+}
+
+std::size_t countWithout(const std::set<std::string>& counted, const std::set<std::string>& left) {
+  return static_cast<std::size_t>(
+      std::count_if(counted.begin(), counted.end(),
+                    [&](const std::string& uuid) { return !left.contains(uuid); }));
+}
+
+}  // namespace
+
+std::optional<HostSnapshot> readHostSnapshot(HostLink& host, ErrorPtr* error) {
+  HostSnapshot snapshot;
+  ErrorPtr problem;
+  snapshot.bytes = host.snapshot(&problem);
+  if (!snapshot.bytes) {
+    if (!problem) {
+      problem = syncError(SyncErrorCode::kHostUnreadable,
+                          "the snapshot of " + host.description() + " cannot be read");
+    }
+    setError(error, problem);
+    return std::nullopt;
+  }
+  auto checked = checkSnapshot(snapshot.bytes, error);
+  if (!checked) return std::nullopt;
+  snapshot.checked = std::move(*checked);
+  return snapshot;
+}
+
+SyncSession::SyncSession(const Context& context, const HostSnapshot& snapshot)
+    : context_(context),
+      snapshot_(snapshot),
+      files_(context.device.platform().files()),
+      librarySwitch_(files_),
+      startedAt_(context.device.platform().clock().absoluteTime()) {}
+
+SyncResult SyncSession::run() {
+  enter(SyncPhase::kChecking);
+  const bool reconciled = checkBeforeFirstEffect() && !stopIfCancelled() && putSnapshotInPlace() &&
+                          prepare() && reconcile();
+  if (reconciled) transferAndEnd();
+  conclude();
+  result_.seconds = context_.device.platform().clock().absoluteTime() - startedAt_;
+  return std::move(result_);
+}
+
+bool SyncSession::checkBeforeFirstEffect() {
+  DeviceComparison comparison;
+  ErrorPtr error = compareWithDevice(snapshot_.checked, context_.device.platform(), &comparison);
+  if (!error) error = refuseDeviceMadeContainers(comparison);
+  if (!error && !context_.options.allowDeletes) {
+    error = guardAgainstDeletes(snapshot_.checked, comparison);
+  }
+  if (!error) error = refuseWithoutSpace(comparison, context_.host, context_.options);
+  std::shared_ptr<PluginModule> module;
+  if (!error) module = PluginModule::load(context_.options.pluginPath, &error);
+  if (!error) {
+    plugin_ = std::make_unique<PluginHost>(std::move(module), context_.device.platform());
+    error = plugin_->createClient();
+  }
+  if (!error) {
+    bool isComplete = false;
+    plugin_->call([&](FRClient& client) { isComplete = hasNeededOperations(client); });
+    if (!isComplete) {
+      error = syncError(SyncErrorCode::kPlugin, "the plug-in lacks an operation that a sync needs");
+    }
+  }
+  if (error) fail(error);
+  return error == nullptr;
+}
+
+bool SyncSession::putSnapshotInPlace() {
+  ErrorPtr error = librarySwitch_.rollBack();
+  if (!error) staging_ = Staging::open(context_.options.deviceRoot, &error);
+  if (staging_) staging_->clear();
+  // A file that holds these bytes already is left as it is.
+  if (!error) files_.writeFileAtomically(kSnapshotPath, snapshot_.bytes->span(), &error);
+  if (error) fail(prefixed("the snapshot cannot be put on the device", *error));
+  return error == nullptr;
+}
+
+bool SyncSession::prepare() {
+  enter(SyncPhase::kPreparing);
+  context_.device.health().reset();
+  context_.device.takeChanges();
+  if (!callPrepare()) {
+    endWithoutTransfers();
+    return false;
+  }
+  if (!stopIfCancelled()) return true;
+  endWithoutTransfers();
+  return false;
+}
+
+bool SyncSession::callPrepare() {
+  bool prepared = false;
+  ErrorPtr error;
+  const auto raised = plugin_->call([&](FRClient& client) {
+    prepared = client.prepareForSyncWithHostAnchor(kAnchor, {}, &error);
+  });
+  if (raised) {
+    prepared = false;
+    error = syncError(SyncErrorCode::kPlugin, raised->name + ": " + raised->reason);
+  }
+  if (!prepared) failCall(SyncErrorCode::kPrepare, "preparing the sync failed", error);
+  return prepared;
+}
+
+bool SyncSession::reconcile() {
+  enter(SyncPhase::kReconciling);
+  const bool isResync = predictResync();
+  const bool hadLastSynced = files_.fileExists(kLastSyncedPath);
+  if (const ErrorPtr error = librarySwitch_.begin(snapshot_.checked.libraryUUID)) {
+    fail(prefixed("the name of the library before cannot be kept", *error));
+    endWithoutTransfers();
+    return false;
+  }
+  ErrorPtr error;
+  const bool reconciled = callReconcile(&error);
+  settleLibrarySwitch(reconciled);
+  if (!reconciled) {
+    failCall(SyncErrorCode::kReconcile, "reconciling failed", error);
+    endWithoutTransfers();
+    return false;
+  }
+  result_.resync = isResync;
+  // Every reconcile but a null one takes the last-synced snapshot away.
+  isNull_ = hadLastSynced && files_.fileExists(kLastSyncedPath);
+  return true;
+}
+
+bool SyncSession::callReconcile(ErrorPtr* error) {
+  bool reconciled = false;
+  const auto raised = plugin_->call(
+      [&](FRClient& client) { reconciled = client.reconcileSync(kSyncType, kAnchor, {}, error); });
+  if (!raised) return reconciled;
+  *error = syncError(SyncErrorCode::kPlugin, raised->name + ": " + raised->reason);
+  return false;
+}
+
+void SyncSession::settleLibrarySwitch(bool reconciled) {
+  const bool isWhole = reconciled && !context_.device.health().anyFailure();
+  const ErrorPtr error = isWhole ? librarySwitch_.commit() : librarySwitch_.rollBack();
+  // Whatever stays behind is put back at the next start: a resync too many, never one too few.
+  if (error) context_.device.health().noteFailure("current library file", error);
+}
+
+// By the rules of the reconcile, over the same files, before it changes them.
+bool SyncSession::predictResync() {
+  ErrorPtr ignored;
+  const DataPtr last =
+      files_.fileExists(kLastSyncedPath) ? files_.readFile(kLastSyncedPath, &ignored) : nullptr;
+  if (last && last->isEqualToData(*snapshot_.bytes)) return false;
+  Value known = last ? readDevicePropertyList(files_, kLastSyncedPath)["libraryUUID"] : Value();
+  if (!known.isString()) {
+    known = readDevicePropertyList(files_, kCurrentLibraryPath)["libraryUUID"];
+  }
+  return !known.isString() || known.stringValue() != snapshot_.checked.libraryUUID;
+}
+
+void SyncSession::transferAndEnd() {
+  enter(SyncPhase::kTransferring);
+  const bool allArrived = transfer();
+  enter(SyncPhase::kFinishing);
+  DeviceHealth& health = context_.device.health();
+  // What the asset daemon has not come to yet may still fail, and the flag is to say so.
+  if (!cancelled_) context_.device.drain();
+  const bool flag = allArrived && !cancelled_ && !result_.error && !health.anyFailure();
+  const auto raised =
+      plugin_->call([&](FRClient& client) { client.assetTransferEndedWithSuccess(flag); });
+  const auto raisedToo =
+      plugin_->call([&](FRClient& client) { client.syncEndedWithSuccess(flag && !raised); });
+  ended_ = true;
+  for (const auto& each : {raised, raisedToo}) {
+    if (each) {
+      fail(syncError(SyncErrorCode::kPlugin,
+                     "ending the sync failed: " + each->name + ": " + each->reason));
+    }
+  }
+}
+
+bool SyncSession::transfer() {
+  std::vector<FRAssetPtr> outstanding;
+  const auto raised =
+      plugin_->call([&](FRClient& client) { outstanding = client.outstandingAssetTransfers(); });
+  if (raised) {
+    fail(syncError(SyncErrorCode::kPlugin,
+                   "listing the transfers failed: " + raised->name + ": " + raised->reason));
+    return false;
+  }
+  for (const FRAssetPtr& request : outstanding) {
+    if (request && !request->isRestore()) requested_.insert(request->identifier());
+  }
+  TransferLoop loop({context_.host, *staging_, *plugin_, context_.device.health(), context_.cancel,
+                     context_.progress},
+                    result_);
+  loop.run(outstanding);
+  diskFull_ = loop.isDiskFull();
+  if (loop.wasCancelled()) stopIfCancelled();
+  return loop.allArrived();
+}
+
+bool SyncSession::stopIfCancelled() {
+  if (!context_.cancel.isCancelled()) return false;
+  const int signal = context_.cancel.signal();
+  cancelled_ = true;
+  result_.outcome = SyncOutcome::kStopped;
+  result_.exitCode = 128 + signal;
+  result_.error = syncError(SyncErrorCode::kCancelled,
+                            signal == SIGINT ? "interrupted; the same command goes on from here"
+                                             : "terminated; the same command goes on from here");
+  return true;
+}
+
+void SyncSession::endWithoutTransfers() {
+  const auto raised = plugin_->call([&](FRClient& client) { client.syncEndedWithSuccess(false); });
+  if (raised) {
+    fail(syncError(SyncErrorCode::kPlugin,
+                   "ending the sync failed: " + raised->name + ": " + raised->reason));
+  }
+}
+
+void SyncSession::conclude() {
+  if (plugin_) {
+    if (const auto raised = plugin_->destroyClient()) {
+      fail(syncError(SyncErrorCode::kPlugin,
+                     "the plug-in's end raised " + raised->name + ": " + raised->reason));
+    }
+  }
+  if (!staging_) return;
+  context_.device.drain();
+  staging_->clear();
+  collectChanges();
+  if (ended_ && !cancelled_) judge();
+}
+
+void SyncSession::collectChanges() {
+  for (const auto& failure : context_.device.health().importFailures()) {
+    const Error* error = failure.error.get();
+    result_.failed.push_back(SyncFailure{failure.uuid, error ? error->domain() : "",
+                                         error ? error->code() : 0,
+                                         error ? error->message() : "the import failed"});
+  }
+  const LibraryChanges changes = context_.device.takeChanges();
+  result_.imported = changes.importedAssets.size();
+  result_.deletedAssets = countWithout(changes.deletedAssets, requested_);
+  std::set<std::string> replaced = changes.importedAssets;
+  replaced.insert(changes.deletedAssets.begin(), changes.deletedAssets.end());
+  result_.updatedAssets = countWithout(changes.updatedAssets, replaced);
+  result_.albumsCreated = countWithout(changes.createdContainers, changes.deletedContainers);
+  result_.albumsDeleted = countWithout(changes.deletedContainers, changes.createdContainers);
+  std::set<std::string> anew = changes.createdContainers;
+  anew.insert(changes.deletedContainers.begin(), changes.deletedContainers.end());
+  result_.albumsRenamed = countWithout(changes.renamedContainers, anew);
+}
+
+// The end of a run whose calls were all made.
+void SyncSession::judge() {
+  const ErrorPtr failure = context_.device.health().firstFailure();
+  const bool importFull =
+      std::any_of(result_.failed.begin(), result_.failed.end(), [](const SyncFailure& failed) {
+        return isNoSpaceError(Error::make(failed.domain, failed.code));
+      });
+  if (diskFull_ || importFull || isNoSpaceError(failure)) {
+    result_.error = nullptr;
+    fail(syncError(SyncErrorCode::kNoSpace,
+                   "no space left on the device: " + std::to_string(result_.imported) + " of " +
+                       std::to_string(result_.requested) + " files were brought"));
+    return;
+  }
+  if (failure) fail(prefixed("the device library failed", *failure));
+  if (result_.error) return;
+  if (!result_.failed.empty()) {
+    result_.outcome = SyncOutcome::kPartial;
+    result_.exitCode = kExitPartial;
+    const std::size_t count = result_.failed.size();
+    result_.error =
+        syncError(SyncErrorCode::kMissingParts,
+                  std::to_string(count) + (count == 1 ? " photo" : " photos") + " did not make it");
+    return;
+  }
+  if (!files_.fileExists(kLastSyncedPath)) {
+    fail(syncError(SyncErrorCode::kNotSealed,
+                   "everything arrived, but the device could not prove that it holds it"));
+    return;
+  }
+  result_.outcome = isNull_ ? SyncOutcome::kNull : SyncOutcome::kSynced;
+  result_.exitCode = kExitDone;
+}
+
+void SyncSession::enter(SyncPhase phase) {
+  if (!context_.progress) return;
+  SyncProgress progress;
+  progress.phase = phase;
+  context_.progress(progress);
+}
+
+void SyncSession::fail(const ErrorPtr& error) {
+  if (result_.error) return;
+  result_.error = error;
+  result_.outcome = SyncOutcome::kFailed;
+  result_.exitCode = isNoSpaceError(error) ? kExitNoSpace : kExitFailed;
+  if (error->domain() == kSyncErrorDomain &&
+      error->code() == static_cast<std::int64_t>(SyncErrorCode::kGuard)) {
+    result_.outcome = SyncOutcome::kStopped;
+    result_.exitCode = kExitGuard;
+  }
+}
+
+// A call that answered false or raised: its own error, else what the device noted meanwhile.
+void SyncSession::failCall(SyncErrorCode code, const std::string& call, const ErrorPtr& error) {
+  const ErrorPtr noted = context_.device.health().firstFailure();
+  if (isNoSpaceError(noted)) return fail(prefixed(call, *noted));
+  if (error) return fail(prefixed(call, *error));
+  if (noted) return fail(prefixed(call, *noted));
+  fail(syncError(code, call + ": the plug-in gave no reason"));
+}
+
+}  // namespace kx

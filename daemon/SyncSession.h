@@ -1,0 +1,77 @@
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <set>
+#include <string>
+
+#include "daemon/DeviceChecks.h"
+#include "daemon/FileTransfer.h"
+#include "daemon/LibrarySwitch.h"
+#include "daemon/PluginHost.h"
+#include "daemon/SnapshotChecker.h"
+#include "daemon/SyncRunner.h"
+
+namespace kx {
+
+// A host's snapshot, read and checked before a device is touched.
+struct HostSnapshot {
+  DataPtr bytes;
+  CheckedSnapshot checked;
+};
+std::optional<HostSnapshot> readHostSnapshot(HostLink& host, ErrorPtr* error);
+
+// One run of a sync over an open device: the phases in order, each on top of what the ones before
+// found. Made for one run and used on one thread.
+class SyncSession {
+ public:
+  struct Context {
+    HostLink& host;
+    ReferenceDevice& device;
+    const SyncOptions& options;
+    const SyncProgressCallback& progress;
+    const CancelToken& cancel;
+  };
+  SyncSession(const Context& context, const HostSnapshot& snapshot);
+
+  SyncResult run();
+
+ private:
+  // The phases; false ends the run with what `result_` says by then.
+  bool checkBeforeFirstEffect();
+  bool putSnapshotInPlace();
+  bool prepare();
+  bool reconcile();
+  void transferAndEnd();
+  bool transfer();  // true when every file arrived
+
+  bool callPrepare();
+  bool callReconcile(ErrorPtr* error);
+  bool stopIfCancelled();
+  void endWithoutTransfers();
+  void settleLibrarySwitch(bool reconciled);
+  void conclude();
+  void collectChanges();
+  void judge();
+  bool predictResync();
+  void enter(SyncPhase phase);
+  // Ends the run: notes the first error and the exit code that goes with it.
+  void fail(const ErrorPtr& error);
+  void failCall(SyncErrorCode code, const std::string& call, const ErrorPtr& error);
+
+  Context context_;
+  const HostSnapshot& snapshot_;
+  FileSystem& files_;
+  LibrarySwitch librarySwitch_;
+  std::unique_ptr<PluginHost> plugin_;
+  std::unique_ptr<Staging> staging_;
+  SyncResult result_;
+  std::set<std::string> requested_;  // identifiers of the sync requests
+  double startedAt_;
+  bool isNull_ = false;
+  bool cancelled_ = false;
+  bool diskFull_ = false;
+  bool ended_ = false;  // the two end calls of a sync were made
+};
+
+}  // namespace kx
