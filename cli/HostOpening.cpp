@@ -1,0 +1,89 @@
+#include "cli/HostOpening.h"
+
+#include <CLI/CLI.hpp>
+#include <cstdlib>
+#include <regex>
+
+#include "cli/Progress.h"
+
+namespace kx::cli {
+
+namespace {
+
+constexpr std::size_t kProblemsShown = 20;
+constexpr int kMinutesAnHour = 60;
+constexpr int kFurthestOffsetMinutes = 14 * kMinutesAnHour;
+constexpr int kSignalExitBase = 128;
+
+std::string readingLine(const HostProgress& progress) {
+  const std::string done = groupedNumber(progress.filesDone);
+  if (progress.phase == HostProgress::Phase::kListing)
+    return "listing the host: " + done + " files";
+  const std::string of = progress.filesTotal > 0 ? " of " + groupedNumber(progress.filesTotal) : "";
+  if (progress.phase == HostProgress::Phase::kReading)
+    return "reading the host: " + done + of + " files";
+  return "copying: " + done + of + " files, " + readableBytes(progress.bytesDone);
+}
+
+}  // namespace
+
+void addFolderReadingOptions(CLI::App& command, FolderReading& reading) {
+  command
+      .add_option("--library-id", reading.libraryId,
+                  "Identity of a folder's library (default: from the folder's path)")
+      ->type_name("UUID");
+  command
+      .add_option("--timezone", reading.timezone,
+                  "Offset of capture times that state none: UTC (default), +02:00, -05:30 ...")
+      ->type_name("OFFSET");
+}
+
+int timezoneMinutes(const std::string& text) {
+  if (text.empty() || text == "UTC" || text == "Z") return 0;
+  static const std::regex kOffset("([+-])([0-9]{1,2})(:?([0-9]{2}))?");
+  std::smatch parts;
+  if (std::regex_match(text, parts, kOffset)) {
+    const int hours = std::stoi(parts[2].str());
+    const int minutes = parts[4].matched ? std::stoi(parts[4].str()) : 0;
+    const int offset = hours * kMinutesAnHour + minutes;
+    if (minutes < kMinutesAnHour && offset <= kFurthestOffsetMinutes) {
+      return parts[1].str() == "-" ? -offset : offset;
+    }
+  }
+  throw UsageError("--timezone: \"" + text + "\" is no offset like UTC, +02:00 or -05:30");
+}
+
+HostOptions hostOptions(Context& context, const FolderReading& reading, const CancelToken& cancel) {
+  HostOptions options;
+  options.libraryID = reading.libraryId;
+  options.timezoneOffsetMinutes = timezoneMinutes(reading.timezone);
+  options.userAgent = std::string("kxsync/") + KX_VERSION;
+  options.progress = [&context, &cancel](const HostProgress& progress) {
+    if (!context.options.quiet) context.console.progress(readingLine(progress));
+    return !cancel.isCancelled();
+  };
+  return options;
+}
+
+void reportHostProblems(Context& context, const std::vector<HostProblem>& problems) {
+  std::size_t shown = 0;
+  for (const HostProblem& problem : problems) {
+    if (shown == kProblemsShown) break;
+    context.console.warning(problem.path + ": " + problem.text);
+    ++shown;
+  }
+  if (shown < problems.size()) {
+    context.console.warning("... and " + groupedNumber(problems.size() - shown) +
+                            " more like these (--json lists all)");
+  }
+}
+
+int exitCodeForHostError(const ErrorPtr& error, const CancelToken& cancel) {
+  if (cancel.isCancelled()) return kSignalExitBase + cancel.signal();
+  if (isNoSpaceError(error)) return kExitNoSpace;
+  const bool usage = error && error->domain() == kHostErrorDomain &&
+                     error->code() == static_cast<std::int64_t>(HostError::kUsage);
+  return usage ? kExitUsage : kExitFailed;
+}
+
+}  // namespace kx::cli

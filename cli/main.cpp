@@ -1,0 +1,10 @@
+#include <string>
+#include <vector>
+
+#include "cli/Cli.h"
+
+int main(int argc, char** argv) {
+  const std::vector<std::string> arguments(argv + (argc > 0 ? 1 : 0), argv + argc);
+  kx::cli::Console console(kx::cli::Console::processSetup());
+  return kx::cli::run(arguments, console);
+}
