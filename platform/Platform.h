@@ -18,6 +18,8 @@
 
 namespace kx {
 
+class KXSTransportDecoder;
+
 // Values that are made once per process: here, once per platform instance. Any thread; the maker
 // runs once, under a lock of its own key alone.
 class OncePerPlatform {
@@ -63,6 +65,12 @@ class Platform {
   virtual bool isMainThread() = 0;
   // The home directory of the user "mobile", an absolute device path.
   virtual std::string mobileHomeDirectory() = 0;
+  // The decoder that the plug-in uses where it would use `own`, its own one. A platform may put
+  // something around it; asked for at every reconcile.
+  virtual std::shared_ptr<KXSTransportDecoder> snapshotDecoder(
+      std::shared_ptr<KXSTransportDecoder> own) {
+    return own;
+  }
 
   OncePerPlatform& once() { return once_; }
 

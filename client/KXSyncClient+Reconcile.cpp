@@ -1,0 +1,195 @@
+#include "client/KXSyncClient.h"
+
+#include <exception>
+
+#include "platform/foundation/PropertyList.h"
+#include "transport/KXSTransportDecoder.h"
+
+namespace kx {
+namespace {
+
+constexpr const char* kSource = "KXSyncClient";
+constexpr const char* kFunction = "reconcileSync";
+constexpr const char* kFileURLScheme = "file://";
+constexpr std::string_view kLibraryUUID = "libraryUUID";
+constexpr std::string_view kUserAgent = "userAgent";
+constexpr std::string_view kTesselUserAgent = "TesselUserAgent";
+constexpr std::string_view kLibraryKind = "libraryKind";
+constexpr std::int64_t kMasterAlbumSubclass = 5;
+
+bool isMasterAlbum(const KXSItem* item) {
+  const auto* album = dynamic_cast<const KXSAlbum*>(item);
+  if (album == nullptr) return false;
+  const std::optional<Number> subclass = album->albumSubclass();
+  return subclass && subclass->int64Value() == kMasterAlbumSubclass;
+}
+
+}  // namespace
+
+bool KXSyncClient::reconcileSync(std::uint32_t syncType, const std::string& newAnchor,
+                                 const ProgressCallback& /*progressCallback*/, ErrorPtr* error) {
+  syncRequested_ = true;
+  assertNotOnMainThread();
+  KX_LOG(kSource, kFunction, LogLevel::kInfo, "Reconcile Sync: (type=%d) anchor: %@", syncType,
+         newAnchor);
+  KX_LOG(kSource, kFunction, LogLevel::kInfo, "Library before: %@", library_);
+  _initializeLibrary();
+
+  ErrorPtr decoderError;
+  const KXSLibraryChangeSnapshotPtr snapshot = decodeNewSnapshot(error, &decoderError);
+  KX_LOG(kSource, kFunction, LogLevel::kError, "snapshot %@ err: %@", snapshot, decoderError);
+  if (decoderError) {
+    KX_LOG(kSource, kFunction, LogLevel::kInfo, "Forwarding error from KXS");
+    setError(error, decoderError);
+    return false;
+  }
+  if (!snapshot) {
+    // The reader's own error, if there is one, says more.
+    if (error != nullptr && !*error) {
+      *error = std::make_shared<const Error>(kBundleIdentifier, kKXErrorNoSnapshot);
+    }
+    return false;
+  }
+  _initializeOutstandingAssets();
+
+  OptionalString previousUUID;
+  const KXSLibraryChangeSnapshotPtr previous = previousSnapshot(&previousUUID);
+  const bool isNullSync = snapshot->isEqualToSnapshot(previous);
+  const bool isResync = decideResync(previousUUID, *snapshot);
+  Dictionary current;
+  current.setIfPresent(kLibraryUUID, Value::optionalString(snapshot->libraryUUID()));
+  writeDictionary(kKXCurrentLibraryUUIDPath, std::move(current));
+  if (isNullSync) {
+    KX_LOG(kSource, kFunction, LogLevel::kDebug,
+           "NULL PHOTO SYNC DETECTED - NO RECONCILING NEEDED");
+  } else {
+    reconcileSnapshot(snapshot, isResync);
+  }
+  lastSyncJobsSaveTime_ = platform_.clock().now().secondsSinceReference;
+  return true;
+}
+
+// Reads and decodes the snapshot file and keeps what the host said about itself. Null when nothing
+// could be decoded; the reader's error goes to `error`.
+KXSLibraryChangeSnapshotPtr KXSyncClient::decodeNewSnapshot(ErrorPtr* error,
+                                                            ErrorPtr* decoderError) {
+  FileSystem& files = platform_.files();
+  KX_LOG(kSource, kFunction, LogLevel::kInfo, "Loading up change snapshot");
+  KX_LOG(kSource, kFunction, LogLevel::kInfo, "Sync url %@",
+         std::string(kFileURLScheme) + kKXSnapshotPath);
+  const std::shared_ptr<KXSTransportDecoder> decoder =
+      platform_.snapshotDecoder(KXSTransportDecoder::decoder());
+  Value root;
+  if (const DataPtr bytes = files.readFile(kKXSnapshotPath, error)) {
+    root = readPropertyList(bytes, error);
+  }
+  const std::string agentPath = platform_.photoLibrary().syncInfoPath();
+  removeSyncUserAgentInfoFile(agentPath);
+  if (!root.isDictionary()) return nullptr;
+
+  Dictionary agent;
+  agent.setIfPresent(kUserAgent, root[kTesselUserAgent]);
+  KXSLibraryChangeSnapshotPtr snapshot =
+      decoder->decodeSnapshotFromPropertyList(root, decoderError);
+  if (!snapshot) return nullptr;
+  agent.setIfPresent(kLibraryKind, Value::optionalString(snapshot->libraryKind()));
+  if (!agent.empty()) writeDictionary(agentPath, std::move(agent));
+  return snapshot;
+}
+
+void KXSyncClient::removeSyncUserAgentInfoFile(const std::string& path) {
+  if (!platform_.files().fileExists(path)) return;
+  ErrorPtr error;
+  if (platform_.files().removeItem(path, &error)) return;
+  KX_LOG(kSource, kFunction, LogLevel::kError,
+         "Failed to remove syncUserAgentInfoFile at path %@ err: %@", path, error);
+}
+
+// The snapshot of the last completed sync with the identifier of its library. Whatever is wrong
+// with that file, it only means that there is no previous snapshot.
+KXSLibraryChangeSnapshotPtr KXSyncClient::previousSnapshot(OptionalString* libraryUUID) {
+  const Value root = readDictionary(KXPreviousMetadataSyncFilePath);
+  if (root.isNull()) return nullptr;
+  try {
+    KXSLibraryChangeSnapshotPtr previous =
+        KXSTransportDecoder::decoder()->decodeSnapshotFromPropertyList(root, nullptr);
+    *libraryUUID = previous->libraryUUID();
+    return previous;
+  } catch (const std::exception&) {
+    return nullptr;
+  }
+}
+
+bool KXSyncClient::decideResync(OptionalString previousUUID,
+                                const KXSLibraryChangeSnapshot& snapshot) {
+  const OptionalString uuid = snapshot.libraryUUID();
+  if (previousUUID) return previousUUID != uuid;
+  const Value stored = readDictionary(kKXCurrentLibraryUUIDPath)[kLibraryUUID];
+  if (!stored.isNull() && stored == Value::optionalString(uuid)) return false;
+  KX_LOG(kSource, kFunction, LogLevel::kInfo,
+         "Forcing resync based on CurrentLibraryUUID.plist: previous %@, snapshot %@", stored,
+         uuid);
+  return true;
+}
+
+void KXSyncClient::reconcileSnapshot(const KXSLibraryChangeSnapshotPtr& snapshot, bool isResync) {
+  // An interrupted sync must never be taken for a null sync the next time.
+  platform_.files().removeItem(KXPreviousMetadataSyncFilePath, nullptr);
+  const KXSItemMapPtr& items = snapshot->albumsAndEventsByUUID();
+  setAlbumsAndEvents(items ? std::make_shared<KXSItemMap>(*items) : nullptr);
+  _pullOutMasterAlbumFromAlbumsAndEvents();
+  uuidToKXSAsset_ = snapshot->assetsByUUID();
+  snapshot_ = snapshot;
+  isResync_ = isResync;
+  _reconcileMetadata();
+  const std::shared_ptr<TransferList> outstanding = outstandingAssets();
+  KX_LOG(kSource, kFunction, LogLevel::kInfo,
+         "Done reconciling! isResync %d, Outstanding assets: %@", isResync_ ? 1 : 0,
+         describeTransfers(outstanding));
+}
+
+void KXSyncClient::_pullOutMasterAlbumFromAlbumsAndEvents() {
+  if (!albumsAndEvents_) return;
+  KXSAlbumPtr found;
+  for (const auto& entry : *albumsAndEvents_) {
+    if (!isMasterAlbum(entry.value.get())) continue;
+    found = std::static_pointer_cast<KXSAlbum>(entry.value);
+    break;
+  }
+  if (!found) return;
+  masterAlbum_ = found;
+  if (const OptionalString uuid = found->uuid()) albumsAndEvents_->remove(*uuid);
+}
+
+void KXSyncClient::_reconcileMetadata() {
+  KX_LOG(kSource, "_reconcileMetadata", LogLevel::kInfo, "Entering reconcileMetadata");
+  const auto group = std::make_shared<DispatchGroup>();
+  BlockFailure failure;
+  submitWatched(failure, [this, &group] {
+    _reconcileAlbums(group);
+    _reconcileAssets(group);
+    _setPendingAlbumCounts(group);
+    _createAlbumUUIDToObjectIDMap(group);
+  });
+  KX_LOG(kSource, "_reconcileMetadata", LogLevel::kInfo, "Waiting for reconcile to finish");
+  group->wait();
+  failure.rethrow();
+  KX_LOG(kSource, "_reconcileMetadata", LogLevel::kInfo, "Leaving reconcileMetadata!");
+}
+
+// Failures are not reported.
+void KXSyncClient::writeDictionary(const std::string& path, Dictionary dictionary) {
+  const std::vector<std::uint8_t> bytes = writePropertyList(
+      Value::dictionary(std::move(dictionary)), PropertyListFormat::kBinary, nullptr);
+  if (!bytes.empty()) platform_.files().writeFileAtomically(path, bytes, nullptr);
+}
+
+// Null when the file is missing, unreadable or holds no dictionary.
+Value KXSyncClient::readDictionary(const std::string& path) {
+  const DataPtr bytes = platform_.files().readFile(path, nullptr);
+  if (!bytes) return Value();
+  const Value root = readPropertyList(bytes, nullptr);
+  return root.isDictionary() ? root : Value();
+}
+
+}  // namespace kx
