@@ -38,9 +38,9 @@ KXSAlbumPtr KXSAlbum::initFromPropertyList(const Value& dictionary) {
   return std::make_shared<KXSAlbum>(Token(), RecordFields(dictionary, allKeys(), "item"));
 }
 
-KXSAlbumPtr KXSAlbum::initFromPropertyList(const Value& dictionary,
+KXSAlbumPtr KXSAlbum::initFromPropertyList(Value dictionary,
                                            const RecordFields::Positions& positions) {
-  return std::make_shared<KXSAlbum>(Token(), RecordFields(dictionary, positions));
+  return std::make_shared<KXSAlbum>(Token(), RecordFields(std::move(dictionary), positions));
 }
 
 KXSAlbumPtr KXSAlbum::initWithCoder(KeyedUnarchiver& coder) {

@@ -23,7 +23,7 @@ class KXSAlbum final : public KXSItem {
   static KXSAlbumPtr initWithUUID(OptionalString uuid);
   static KXSAlbumPtr initFromPropertyList(const Value& dictionary);
   // The same, with positions found before (RecordLayouts).
-  static KXSAlbumPtr initFromPropertyList(const Value& dictionary,
+  static KXSAlbumPtr initFromPropertyList(Value dictionary,
                                           const RecordFields::Positions& positions);
   static KXSAlbumPtr initWithCoder(KeyedUnarchiver& coder);
 

@@ -69,9 +69,9 @@ KXSAssetPtr KXSAsset::initFromPropertyList(const Value& dictionary) {
   return std::make_shared<KXSAsset>(Token(), RecordFields(dictionary, allKeys(), "item"));
 }
 
-KXSAssetPtr KXSAsset::initFromPropertyList(const Value& dictionary,
+KXSAssetPtr KXSAsset::initFromPropertyList(Value dictionary,
                                            const RecordFields::Positions& positions) {
-  return std::make_shared<KXSAsset>(Token(), RecordFields(dictionary, positions));
+  return std::make_shared<KXSAsset>(Token(), RecordFields(std::move(dictionary), positions));
 }
 
 KXSAssetPtr KXSAsset::initWithCoder(KeyedUnarchiver& coder) {

@@ -29,7 +29,7 @@ class KXSAsset final : public KXSItem {
   // A missing exposure date is the modification date.
   static KXSAssetPtr initFromPropertyList(const Value& dictionary);
   // The same, with positions found before (RecordLayouts).
-  static KXSAssetPtr initFromPropertyList(const Value& dictionary,
+  static KXSAssetPtr initFromPropertyList(Value dictionary,
                                           const RecordFields::Positions& positions);
   // Dates and location are not archived: they come back null.
   static KXSAssetPtr initWithCoder(KeyedUnarchiver& coder);

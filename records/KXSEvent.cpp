@@ -32,9 +32,9 @@ KXSEventPtr KXSEvent::initFromPropertyList(const Value& dictionary) {
   return std::make_shared<KXSEvent>(Token(), RecordFields(dictionary, allKeys(), "item"));
 }
 
-KXSEventPtr KXSEvent::initFromPropertyList(const Value& dictionary,
+KXSEventPtr KXSEvent::initFromPropertyList(Value dictionary,
                                            const RecordFields::Positions& positions) {
-  return std::make_shared<KXSEvent>(Token(), RecordFields(dictionary, positions));
+  return std::make_shared<KXSEvent>(Token(), RecordFields(std::move(dictionary), positions));
 }
 
 KXSEventPtr KXSEvent::initWithHostPropertyList(const Value& /*dictionary*/) { return nullptr; }

@@ -23,7 +23,7 @@ class KXSEvent final : public KXSItem {
   static KXSEventPtr initWithUUID(OptionalString uuid);
   static KXSEventPtr initFromPropertyList(const Value& dictionary);
   // The same, with positions found before (RecordLayouts).
-  static KXSEventPtr initFromPropertyList(const Value& dictionary,
+  static KXSEventPtr initFromPropertyList(Value dictionary,
                                           const RecordFields::Positions& positions);
   // Always null: the host's own form of an event is not read.
   static KXSEventPtr initWithHostPropertyList(const Value& dictionary);

@@ -51,6 +51,7 @@ bool RecordFields::findPositions(const DictionaryView& view, std::span<const Fie
 Value RecordFields::value(std::size_t slot) const {
   if (values_) return (*values_)[slot];
   if (positions_[slot] == kAbsent) return Value();
+  if (EntryPeek::can(dictionary_)) return EntryPeek::valueOf(dictionary_, positions_[slot]).value();
   return dictionary_.dictionaryValue().valueAt(positions_[slot]);
 }
 

@@ -35,8 +35,8 @@ class RecordFields {
   // Null gives null fields. Anything else that is no dictionary raises TypeError naming `what`.
   RecordFields(const Value& dictionary, std::span<const FieldKey> keys, std::string_view what);
   // Positions found before in a dictionary with the same keys in the same order.
-  RecordFields(const Value& dictionary, const Positions& positions)
-      : dictionary_(dictionary), positions_(positions) {}
+  RecordFields(Value dictionary, const Positions& positions)
+      : dictionary_(std::move(dictionary)), positions_(positions) {}
 
   // Finds the keys; false when one stands too far behind for a position.
   static bool findPositions(const DictionaryView& view, std::span<const FieldKey> keys,

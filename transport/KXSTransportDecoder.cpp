@@ -19,8 +19,8 @@ struct ClassifiedItem {
 };
 
 ItemClass classOfType(std::string_view itemType) {
-  if (itemType == kKXSTransportAlbumItemType) return ItemClass::kAlbum;
   if (itemType == kKXSTransportAssetItemType) return ItemClass::kAsset;
+  if (itemType == kKXSTransportAlbumItemType) return ItemClass::kAlbum;
   if (itemType == kKXSTransportEventItemType) return ItemClass::kEvent;
   throw UnknownObjectType();
 }
@@ -39,7 +39,7 @@ ClassifiedItem plainItem(const Value& dictionary) {
   }
 }
 
-ClassifiedItem itemFromPropertyList(const Value& dictionary, RecordLayouts& layouts) {
+ClassifiedItem itemFromPropertyList(Value dictionary, RecordLayouts& layouts) {
   const RecordLayouts::Layout* layout = layouts.find(dictionary);
   if (layout == nullptr) return plainItem(dictionary);
   if (layout->itemType == RecordFields::kAbsent) throw UnknownObjectType();
@@ -47,11 +47,14 @@ ClassifiedItem itemFromPropertyList(const Value& dictionary, RecordLayouts& layo
   if (type.kind() != Kind::kString) throw UnknownObjectType();
   switch (classOfType(type.text())) {
     case ItemClass::kAlbum:
-      return {ItemClass::kAlbum, KXSAlbum::initFromPropertyList(dictionary, layout->album)};
+      return {ItemClass::kAlbum,
+              KXSAlbum::initFromPropertyList(std::move(dictionary), layout->album)};
     case ItemClass::kAsset:
-      return {ItemClass::kAsset, KXSAsset::initFromPropertyList(dictionary, layout->asset)};
+      return {ItemClass::kAsset,
+              KXSAsset::initFromPropertyList(std::move(dictionary), layout->asset)};
     default:
-      return {ItemClass::kEvent, KXSEvent::initFromPropertyList(dictionary, layout->event)};
+      return {ItemClass::kEvent,
+              KXSEvent::initFromPropertyList(std::move(dictionary), layout->event)};
   }
 }
 
@@ -76,12 +79,12 @@ struct Collections {
   void add(ClassifiedItem classified) {
     Value key = keyOf(*classified.item);
     if (classified.itemClass == ItemClass::kAsset) {
-      assets->set(key, std::static_pointer_cast<KXSAsset>(std::move(classified.item)));
+      assets->set(std::move(key), std::static_pointer_cast<KXSAsset>(std::move(classified.item)));
       checkCount(assets->size(), limits::kAssets, "assets");
       return;
     }
     ordered->push_back(classified.item);
-    containers->set(key, std::move(classified.item));
+    containers->set(std::move(key), std::move(classified.item));
     checkCount(ordered->size(), limits::kContainers, "albums and events");
   }
 };
@@ -108,8 +111,8 @@ KXSItemMapPtr decodeDeletes(const Value& root, RecordLayouts& layouts) {
   const std::size_t count = deletes->size();
   for (std::size_t i = 0; i < count; ++i) {
     KXSItemPtr item = itemFromPropertyList((*deletes)[i], layouts).item;
-    const Value key = keyOf(*item);
-    items->set(key, std::move(item));
+    Value key = keyOf(*item);
+    items->set(std::move(key), std::move(item));
     checkCount(items->size(), limits::kAssets + limits::kContainers, "deletes");
   }
   return items;

@@ -29,13 +29,13 @@ class EntryPeek {
     const PropertyListDocument* document = documentOf(dictionary);
     const DocumentNode& node = document->node(ValueAccess::objectIndex(dictionary));
     const std::size_t count = ValueAccess::size(dictionary);
-    return EntryPeek(*document, document->node(document->reference(node, count + position)));
+    return EntryPeek(*document, document->reference(node, count + position));
   }
   // The index-th element of an array.
   static EntryPeek elementOf(const Value& array, std::size_t index) {
     const PropertyListDocument* document = documentOf(array);
     const DocumentNode& node = document->node(ValueAccess::objectIndex(array));
-    return EntryPeek(*document, document->node(document->reference(node, index)));
+    return EntryPeek(*document, document->reference(node, index));
   }
   // Bytes that are equal for two dictionaries of one document exactly when they hold the same key
   // objects in the same order.
@@ -51,6 +51,8 @@ class EntryPeek {
   Number number() const {
     return ValueAccess::number(static_cast<Number::Type>(node_.detail), node_.bits());
   }
+  // A value of its own, which keeps the file.
+  Value value() const { return document_.valueAt(object_); }
   // Elements of an array, entries of a dictionary.
   std::size_t count() const { return node_.high; }
 
@@ -58,11 +60,12 @@ class EntryPeek {
   static const PropertyListDocument* documentOf(const Value& container) {
     return static_cast<const PropertyListDocument*>(ValueAccess::owner(container));
   }
-  EntryPeek(const PropertyListDocument& document, const DocumentNode& node)
-      : document_(document), node_(node) {}
+  EntryPeek(const PropertyListDocument& document, std::uint32_t object)
+      : document_(document), node_(document.node(object)), object_(object) {}
 
   const PropertyListDocument& document_;
   const DocumentNode& node_;
+  std::uint32_t object_;
 };
 
 }  // namespace kx

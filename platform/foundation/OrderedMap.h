@@ -49,7 +49,7 @@ class OrderedMap {
   bool contains(std::string_view key) const { return findSlot(key) != kNone; }
 
   // Sets or replaces. The key must be a string value.
-  T& set(const Value& key, T value) {
+  T& set(Value key, T value) {
     const std::string_view text = key.stringValue();
     if (const std::size_t slot = findSlot(text); slot != kNone) {
       Entry& entry = entries_[slots_[slot] - 1];
@@ -59,7 +59,7 @@ class OrderedMap {
     // Removed entries keep their place and their slot until the next rehash, so they count here: at
     // most half of the slots are ever taken and every probe meets a free one.
     if ((entries_.size() + 1) * 2 > slots_.size()) rehash(live_ + 1);
-    entries_.push_back(Entry{key, std::move(value)});
+    entries_.push_back(Entry{std::move(key), std::move(value)});
     link(entries_.size() - 1);
     ++live_;
     return entries_.back().value;
