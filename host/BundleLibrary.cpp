@@ -1,0 +1,126 @@
+#include "host/BundleLibrary.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <mutex>
+#include <utility>
+
+#include "host/FolderScan.h"
+#include "host/HostFiles.h"
+#include "host/HostLimits.h"
+#include "platform/foundation/PropertyList.h"
+#include "records/TransportKeys.h"
+
+namespace kx {
+
+namespace {
+
+class BundleLibrary final : public HostLibrary {
+ public:
+  BundleLibrary(std::string path, FileHandle folder)
+      : path_(std::move(path)), folder_(std::move(folder)) {}
+
+  bool open(ErrorPtr* error) {
+    FileHandle file;
+    struct stat status = {};
+    std::vector<std::uint8_t> bytes;
+    int failure = openRegularBeneath(folder_.get(), kBundleSnapshotName, &file, &status);
+    if (failure == 0) failure = readWhole(file.get(), hostlimits::kSnapshotBytes, &bytes);
+    if (failure != 0) return fail(failure, kBundleSnapshotName, error);
+    snapshot_ = std::make_shared<Data>(std::move(bytes));
+    failure = openBeneath(folder_.get(), kBundleMediaName, O_RDONLY | O_DIRECTORY, &media_);
+    if (failure == 0) failure = listNames(media_.get(), &names_);
+    return failure == 0 || fail(failure, kBundleMediaName, error);
+  }
+
+  Form form() const override { return Form::kBundle; }
+  const std::string& path() const override { return path_; }
+  std::string libraryUUID() const override { return rootText(kKXSTransportLibraryUUIDKey); }
+  std::string libraryKind() const override { return rootText(kKXSTransportLibraryKindKey); }
+  DataPtr snapshotBytes() const override { return snapshot_; }
+  const std::vector<HostProblem>& problems() const override { return problems_; }
+
+  std::optional<HostMedia> openMedia(std::string_view uuid, ErrorPtr* error) const override {
+    const std::string name = nameOf(uuid);
+    if (name.empty()) {
+      setError(error, posixError(ENOENT, "no file of the host"));
+      return std::nullopt;
+    }
+    std::optional<HostMedia> media = openHostMedia(media_.get(), name, error);
+    if (media) media->path = std::string(kBundleMediaName) + "/" + name;
+    return media;
+  }
+
+  std::optional<std::int64_t> mediaSize(std::string_view uuid) const override {
+    const std::string name = nameOf(uuid);
+    struct stat status = {};
+    if (name.empty() || ::fstatat(media_.get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0 ||
+        !S_ISREG(status.st_mode))
+      return std::nullopt;
+    return status.st_size;
+  }
+
+  // A name's UUID is what stands before its first dot.
+  std::vector<MediaName> mediaNames() const override {
+    std::vector<MediaName> result;
+    for (const std::string& name : names_) {
+      if (name.front() == '.') continue;
+      std::string uuid = name.substr(0, name.find('.'));
+      if (nameOf(uuid) == name) result.push_back({std::move(uuid), name});
+    }
+    return result;
+  }
+
+ private:
+  static bool fail(int failure, const std::string& name, ErrorPtr* error) {
+    setError(error, hostError(HostError::kUnreadable,
+                              "\"" + name + "\" cannot be read: " + systemErrorText(failure)));
+    return false;
+  }
+
+  // The name of the asset's file in media/, "" when there is none.
+  std::string nameOf(std::string_view uuid) const {
+    if (!isOneComponent(uuid)) return {};
+    const std::string exact(uuid);
+    if (std::binary_search(names_.begin(), names_.end(), exact)) return exact;
+    const std::string prefix = exact + ".";
+    const auto found = std::lower_bound(names_.begin(), names_.end(), prefix);
+    return found != names_.end() && found->starts_with(prefix) ? *found : std::string();
+  }
+
+  std::string rootText(std::string_view key) const {
+    std::call_once(decoded_, [this] { root_ = readPropertyList(snapshot_, nullptr); });
+    const Value value = root_[key];
+    return value.isString() ? std::string(value.stringValue()) : std::string();
+  }
+
+  std::string path_;
+  FileHandle folder_;
+  FileHandle media_;
+  std::vector<std::string> names_;  // in media/, sorted by bytes
+  DataPtr snapshot_;
+  std::vector<HostProblem> problems_;
+  mutable std::once_flag decoded_;
+  mutable Value root_;
+};
+
+}  // namespace
+
+bool isHostBundle(int folder) {
+  struct stat snapshot = {};
+  struct stat media = {};
+  return ::fstatat(folder, kBundleSnapshotName, &snapshot, AT_SYMLINK_NOFOLLOW) == 0 &&
+         ::fstatat(folder, kBundleMediaName, &media, AT_SYMLINK_NOFOLLOW) == 0 &&
+         S_ISDIR(media.st_mode);
+}
+
+std::unique_ptr<HostLibrary> openBundleLibrary(const std::string& path, FileHandle folder,
+                                               ErrorPtr* error) {
+  auto result = std::make_unique<BundleLibrary>(path, std::move(folder));
+  return result->open(error) ? std::move(result) : nullptr;
+}
+
+}  // namespace kx

@@ -1,0 +1,22 @@
+#pragma once
+
+#include <memory>
+#include <string>
+
+#include "host/HostLibrary.h"
+
+namespace kx {
+
+inline constexpr const char* kBundleSnapshotName = "PhotoLibrary.plist";
+inline constexpr const char* kBundleMediaName = "media";
+
+// Whether the directory holds PhotoLibrary.plist and the directory media.
+bool isHostBundle(int folder);
+
+// Opens a host bundle: reads its snapshot, and knows the names in media/. The file of an asset is
+// the one named by its UUID exactly, else the first by bytes of those named "UUID.*". Errors as
+// openHostLibrary.
+std::unique_ptr<HostLibrary> openBundleLibrary(const std::string& path, FileHandle folder,
+                                               ErrorPtr* error);
+
+}  // namespace kx
