@@ -82,6 +82,7 @@ class Flattener {
  public:
   void run(const Value& root) {
     try {
+      stack_.reserve(limits::kNestingDepth);
       add(root);
       while (!stack_.empty()) step();
     } catch (PropertyListFailure& failure) {
@@ -313,6 +314,7 @@ class Emitter {
     std::size_t end = kHeaderBytes;
     for (const Object& object : objects_) end += sizeOf(object);
     const unsigned offsetBytes = bytesFor(end);
+    requireFileSize(end + objects_.size() * offsetBytes + kTrailerBytes);
     std::vector<std::uint8_t> bytes(end + objects_.size() * offsetBytes + kTrailerBytes);
     out_ = bytes.data();
     std::uint8_t* table = out_ + end;

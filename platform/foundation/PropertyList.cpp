@@ -5,6 +5,7 @@
 #include "platform/foundation/BinaryPropertyListReader.h"
 #include "platform/foundation/PropertyListFailure.h"
 #include "platform/foundation/PropertyListWriters.h"
+#include "platform/foundation/XmlPropertyListReader.h"
 
 namespace kx {
 namespace {
@@ -50,6 +51,9 @@ Value read(DataPtr bytes, const PropertyListLimits& limits) {
   if (BinaryPropertyListReader::isBinary(base, length)) {
     return BinaryPropertyListReader(std::move(bytes), limits).read();
   }
+  if (XmlPropertyListReader::isXml(base, length)) {
+    return XmlPropertyListReader(std::move(bytes), limits).read();
+  }
   throw PropertyListFailure(PropertyListError::kMagic, "no property list begins like this", 0);
 }
 
@@ -88,10 +92,8 @@ Value readPropertyList(DataPtr bytes, const PropertyListLimits& limits, ErrorPtr
 std::vector<std::uint8_t> writePropertyList(const Value& root, PropertyListFormat format,
                                             ErrorPtr* error) {
   try {
-    if (format != PropertyListFormat::kBinary) {
-      throw PropertyListFailure(PropertyListError::kWrite, "only binary files are written");
-    }
-    return writeBinaryPropertyList(root);
+    return format == PropertyListFormat::kBinary ? writeBinaryPropertyList(root)
+                                                 : writeXmlPropertyList(root);
   } catch (const PropertyListFailure& failure) {
     setError(error, failure.toError());
     return {};

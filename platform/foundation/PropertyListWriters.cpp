@@ -52,6 +52,14 @@ void requireDataSize(std::size_t size) {
   }
 }
 
+void requireFileSize(std::uint64_t size) {
+  if (size > limits::kSnapshotFileBytes) {
+    throw PropertyListFailure(
+        PropertyListError::kLimit,
+        "the file would have more than " + std::to_string(limits::kSnapshotFileBytes) + " bytes");
+  }
+}
+
 void failNull() {
   throw PropertyListFailure(PropertyListError::kWrite, "a null has no form in a property list");
 }

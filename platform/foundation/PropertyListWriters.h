@@ -23,6 +23,7 @@ TextClass classifyText(std::string_view text);
 void requireKey(std::string_view key);
 void requireDate(double secondsSinceReference);
 void requireDataSize(std::size_t size);
+void requireFileSize(std::uint64_t size);
 [[noreturn]] void failNull();
 [[noreturn]] void failDepth();
 
