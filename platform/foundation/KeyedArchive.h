@@ -31,12 +31,16 @@ using ArchivablePtr = std::shared_ptr<Archivable>;
 using ArchivableMap = OrderedMap<ArchivablePtr>;
 
 // Writes an object graph. Layout: a binary property list, see docs/formats/keyed-archive.md (names
-// itself "KXKeyedArchiver", version 1). Used on one thread.
+// itself "KXKeyedArchiver", version 1). Used on one thread. Objects are encoded one after the
+// other, never inside one another; what they throw passes through.
 class KeyedArchiver {
  public:
+  // Empty and an error for a null root, a graph with a cycle (E_ARCHIVE_CYCLE) or with more than 64
+  // objects inside one another (E_PLIST_DEPTH), or a value that cannot be written.
   static std::vector<std::uint8_t> archivedData(const ArchivablePtr& root, ErrorPtr* error);
 
-  // Null values and null objects are left out: the key is then absent.
+  // Null values and null objects are left out: the key is then absent. A key encoded again
+  // replaces.
   void encodeValue(std::string_view key, const Value& value);
   void encodeObject(std::string_view key, const ArchivablePtr& object);
   // A dictionary from string to object, order kept; a null pointer writes nothing.
@@ -63,23 +67,30 @@ class ArchiveClasses {
 };
 
 // Reads an object graph; only classes of `classes` are ever made, any other is an error
-// (E_ARCHIVE_CLASS). A cycle is an error (E_ARCHIVE_CYCLE). Used on one thread.
+// (E_ARCHIVE_CLASS). A cycle is an error (E_ARCHIVE_CYCLE), and so is an object that nothing refers
+// to (E_ARCHIVE_SHAPE). The whole table is checked before the first object is made; makers are
+// nested at most 64 deep, and a TypeError or InternalInconsistency that one raises becomes an error
+// (E_ARCHIVE_SHAPE). Used on one thread.
 class KeyedUnarchiver {
  public:
+  // With a root class, a root of any other is an error (E_ARCHIVE_CLASS).
   static ArchivablePtr unarchivedObject(DataPtr bytes, const ArchiveClasses& classes,
-                                        ErrorPtr* error);
+                                        ErrorPtr* error, std::string_view rootClass = {});
 
-  // Null when absent.
+  // For makers: the fields of the object being made. Null when absent; a field of another sort (a
+  // value where an object is asked for) ends the reading with E_ARCHIVE_SHAPE, an object of another
+  // class than the one named with E_ARCHIVE_CLASS.
   Value decodeValue(std::string_view key);
-  ArchivablePtr decodeObject(std::string_view key);
-  // Null when absent.
-  std::shared_ptr<ArchivableMap> decodeObjectMap(std::string_view key);
+  ArchivablePtr decodeObject(std::string_view key, std::string_view className = {});
+  std::shared_ptr<ArchivableMap> decodeObjectMap(std::string_view key,
+                                                 std::string_view className = {});
 
  private:
   KeyedUnarchiver();
   ~KeyedUnarchiver();
   KeyedUnarchiver(const KeyedUnarchiver&) = delete;
   KeyedUnarchiver& operator=(const KeyedUnarchiver&) = delete;
+  ErrorPtr makerError(const char* what) const;
   struct State;
   std::unique_ptr<State> state_;
 };

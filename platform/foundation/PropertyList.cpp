@@ -5,6 +5,7 @@
 #include "platform/foundation/BinaryPropertyListReader.h"
 #include "platform/foundation/PropertyListFailure.h"
 #include "platform/foundation/PropertyListWriters.h"
+#include "platform/foundation/Text.h"
 #include "platform/foundation/XmlPropertyListReader.h"
 
 namespace kx {
@@ -57,6 +58,13 @@ Value read(DataPtr bytes, const PropertyListLimits& limits) {
   throw PropertyListFailure(PropertyListError::kMagic, "no property list begins like this", 0);
 }
 
+std::string readable(const std::string& text) {
+  constexpr std::size_t kMost = 1024;
+  std::string result = escapeControlCharacters(std::string_view(text).substr(0, kMost));
+  if (text.size() > kMost) result += "...";
+  return result;
+}
+
 }  // namespace
 
 std::string_view propertyListErrorName(PropertyListError code) {
@@ -64,10 +72,11 @@ std::string_view propertyListErrorName(PropertyListError code) {
   return index < std::size(kErrorNames) ? kErrorNames[index] : "E_PLIST";
 }
 
+// Texts from the file stand in messages: control characters are escaped, long ones cut.
 ErrorPtr PropertyListFailure::toError() const {
-  std::string message = std::string(propertyListErrorName(code_)) + ": " + what_;
+  std::string message = std::string(propertyListErrorName(code_)) + ": " + readable(what_);
   Dictionary info;
-  if (!path_.empty()) message += ", under " + path_;
+  if (!path_.empty()) message += ", under " + readable(path_);
   if (offset_ != kNoOffset) message += " at byte " + std::to_string(offset_);
   info.set(kErrorMessageKey, Value::string(message));
   if (offset_ != kNoOffset) info.set("offset", Value::unsignedInteger(offset_));
