@@ -18,6 +18,11 @@ namespace {
 
 constexpr int kSafeFlags = O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC;
 
+// A handle on a path alone is never waited for, and openat2 refuses to be told so.
+int safe(int flags) {
+  return (flags & O_PATH) != 0 ? flags | O_NOFOLLOW | O_CLOEXEC : flags | kSafeFlags;
+}
+
 int openAt(int folder, const std::string& name, int flags, FileHandle* file) {
   int fd = -1;
   do {
@@ -56,7 +61,7 @@ int openFolder(const std::string& path, FileHandle* folder) {
 
 int openBeneath(int folder, const std::string& relativePath, int flags, FileHandle* file) {
   struct open_how how = {};
-  how.flags = static_cast<std::uint64_t>(static_cast<unsigned>(flags | kSafeFlags));
+  how.flags = static_cast<std::uint64_t>(static_cast<unsigned>(safe(flags)));
   how.resolve = RESOLVE_BENEATH | RESOLVE_NO_SYMLINKS | RESOLVE_NO_MAGICLINKS;
   const std::string& path = relativePath.empty() ? std::string(".") : relativePath;
   long fd = -1;
@@ -74,7 +79,7 @@ int openBeneath(int folder, const std::string& relativePath, int flags, FileHand
 
 int openBeneathByComponents(int folder, const std::string& relativePath, int flags,
                             FileHandle* file) {
-  if (relativePath.empty()) return openAt(folder, ".", flags | kSafeFlags, file);
+  if (relativePath.empty()) return openAt(folder, ".", safe(flags), file);
   FileHandle held;
   int current = folder;
   std::size_t start = 0;
@@ -82,9 +87,9 @@ int openBeneathByComponents(int folder, const std::string& relativePath, int fla
     const std::size_t slash = relativePath.find('/', start);
     const std::string name = relativePath.substr(start, slash - start);
     if (!isOneComponent(name)) return EXDEV;
-    if (slash == std::string::npos) return openAt(current, name, flags | kSafeFlags, file);
+    if (slash == std::string::npos) return openAt(current, name, safe(flags), file);
     FileHandle next;
-    const int error = openAt(current, name, O_PATH | O_DIRECTORY | kSafeFlags, &next);
+    const int error = openAt(current, name, safe(O_PATH | O_DIRECTORY), &next);
     if (error != 0) return error;
     held = std::move(next);
     current = held.get();
