@@ -1,0 +1,165 @@
+#include "testing/FaultySaver.h"
+
+#include <algorithm>
+#include <condition_variable>
+#include <utility>
+
+#include "platform/dispatch/Dispatch.h"
+
+namespace kx {
+
+// What completions, which may come late, and jobs share with the saver.
+struct FaultySaver::Shared {
+  std::mutex mutex;
+  std::map<const Data*, bool> finishedBlocks;  // of serialized jobs not handed over yet
+  std::vector<Batch> batches;
+  bool holding = false;
+  std::vector<Held> held;
+  std::size_t keepingBack = 0;  // batches with "cleanupNever" that are under way or kept
+  std::vector<Block> keptBack;
+  std::condition_variable arrived;  // one more is kept back
+  DispatchQueuePtr completions = DispatchQueue::serial("kx.testing.saver-completions");
+};
+
+class FaultySaver::ObservedJob final : public KXSyncSaveJob {
+ public:
+  ObservedJob(FaultScript& script, std::shared_ptr<Shared> shared)
+      : script_(script), shared_(std::move(shared)) {}
+  DataPtr serializedData() const override {
+    if (script_.take("serialize")) return nullptr;
+    DataPtr data = KXSyncSaveJob::serializedData();
+    const std::lock_guard<std::mutex> lock(shared_->mutex);
+    shared_->finishedBlocks[data.get()] = finishedBlock() != nullptr;
+    return data;
+  }
+
+ private:
+  FaultScript& script_;
+  std::shared_ptr<Shared> shared_;
+};
+
+FaultySaver::FaultySaver(KXAssetsSaver& inner, FaultScript& script, FailureHandler onFailure)
+    : inner_(inner),
+      script_(script),
+      onFailure_(std::move(onFailure)),
+      shared_(std::make_shared<Shared>()) {}
+
+FaultySaver::~FaultySaver() {
+  release();
+  deliverKeptBack();
+}
+
+KXSyncSaveJobPtr FaultySaver::newSyncSaveJob() {
+  return std::make_shared<ObservedJob>(script_, shared_);
+}
+
+FaultySaver::Batch FaultySaver::observe(const std::vector<DataPtr>& jobs) {
+  Batch batch;
+  for (const DataPtr& data : jobs) {
+    Job job;
+    if (auto fields = KXSyncSaveJob::fieldsFromSerializedData(data, nullptr)) {
+      job.fields = std::move(*fields);
+    }
+    const auto known = shared_->finishedBlocks.find(data.get());
+    if (known != shared_->finishedBlocks.end()) {
+      job.hasFinishedBlock = known->second;
+      shared_->finishedBlocks.erase(known);
+    }
+    batch.push_back(std::move(job));
+  }
+  return batch;
+}
+
+void FaultySaver::saveSyncedAssets(std::vector<DataPtr> serializedJobs, Completion completion) {
+  {
+    const std::lock_guard<std::mutex> lock(shared_->mutex);
+    shared_->batches.push_back(observe(serializedJobs));
+    if (!shared_->holding && script_.take("saverHold")) shared_->holding = true;
+    if (shared_->holding) {
+      shared_->held.push_back({std::move(serializedJobs), std::move(completion)});
+      return;
+    }
+  }
+  handOver({std::move(serializedJobs), std::move(completion)});
+}
+
+void FaultySaver::handOver(Held batch) {
+  if (const auto fault = script_.take("saver")) {
+    const ErrorPtr error = fault->error ? fault->error : injectedError("saver");
+    if (onFailure_) onFailure_("saver", error);
+    shared_->completions->async(
+        [completion = std::move(batch.completion), error] { completion(0, error); });
+    return;
+  }
+  const bool cleansUp = std::any_of(batch.jobs.begin(), batch.jobs.end(), [](const DataPtr& job) {
+    const auto fields = KXSyncSaveJob::fieldsFromSerializedData(job, nullptr);
+    return fields && fields->cleanupSyncState;
+  });
+  if (cleansUp) {
+    if (const auto fault = script_.take("cleanupError")) {
+      const ErrorPtr error = fault->error ? fault->error : injectedError("cleanupError");
+      if (onFailure_) onFailure_("cleanupError", error);
+      inner_.saveSyncedAssets(
+          std::move(batch.jobs),
+          [completion = std::move(batch.completion), error](std::size_t imported, const ErrorPtr&) {
+            completion(imported, error);
+          });
+      return;
+    }
+    if (script_.take("cleanupNever")) {
+      {
+        const std::lock_guard<std::mutex> lock(shared_->mutex);
+        ++shared_->keepingBack;
+      }
+      inner_.saveSyncedAssets(
+          std::move(batch.jobs), [shared = shared_, completion = std::move(batch.completion)](
+                                     std::size_t imported, const ErrorPtr& outcome) {
+            const std::lock_guard<std::mutex> lock(shared->mutex);
+            shared->keptBack.emplace_back(
+                [completion, imported, outcome] { completion(imported, outcome); });
+            shared->arrived.notify_all();
+          });
+      return;
+    }
+  }
+  inner_.saveSyncedAssets(std::move(batch.jobs), std::move(batch.completion));
+}
+
+std::vector<FaultySaver::Batch> FaultySaver::takeBatches() {
+  const std::lock_guard<std::mutex> lock(shared_->mutex);
+  return std::exchange(shared_->batches, {});
+}
+
+bool FaultySaver::isHolding() const {
+  const std::lock_guard<std::mutex> lock(shared_->mutex);
+  return shared_->holding;
+}
+
+void FaultySaver::release() {
+  std::vector<Held> held;
+  {
+    const std::lock_guard<std::mutex> lock(shared_->mutex);
+    shared_->holding = false;
+    held = std::exchange(shared_->held, {});
+  }
+  for (Held& batch : held) handOver(std::move(batch));
+}
+
+bool FaultySaver::isKeepingBack() const {
+  const std::lock_guard<std::mutex> lock(shared_->mutex);
+  return shared_->keepingBack > 0;
+}
+
+void FaultySaver::deliverKeptBack() {
+  std::vector<Block> kept;
+  {
+    std::unique_lock<std::mutex> lock(shared_->mutex);
+    shared_->arrived.wait(lock,
+                          [this] { return shared_->keptBack.size() >= shared_->keepingBack; });
+    shared_->keepingBack = 0;
+    kept = std::exchange(shared_->keptBack, {});
+  }
+  for (const Block& deliver : kept) deliver();
+}
+
+}  // namespace kx

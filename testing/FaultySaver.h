@@ -1,0 +1,61 @@
+#pragma once
+
+#include <functional>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <vector>
+
+#include "platform/library/KXAssetsSaver.h"
+#include "testing/FaultScript.h"
+
+namespace kx {
+
+// Passes save jobs on to another asset saver, keeps a record of what was handed over, and makes
+// steps fail by script: "serialize" (a job has no serialized form), "saver" (a batch ends with the
+// fault's error and nothing is imported), "saverHold" (from its first hit on, batches wait until
+// release), "cleanupError" (a batch with a clean-up job is worked, and ends with the fault's
+// error), "cleanupNever" (the completion of such a batch is kept back until deliverKeptBack).
+// Failures are told to `onFailure`. Any thread.
+class FaultySaver final : public KXAssetsSaver {
+ public:
+  using FailureHandler = std::function<void(const std::string& what, const ErrorPtr& error)>;
+  struct Job {
+    KXSyncSaveJob::Fields fields;
+    bool hasFinishedBlock = false;
+  };
+  using Batch = std::vector<Job>;
+
+  // Both outlive this object.
+  FaultySaver(KXAssetsSaver& inner, FaultScript& script, FailureHandler onFailure);
+  ~FaultySaver() override;
+
+  KXSyncSaveJobPtr newSyncSaveJob() override;
+  void saveSyncedAssets(std::vector<DataPtr> serializedJobs, Completion completion) override;
+
+  // The batches handed over since the last call, oldest first.
+  std::vector<Batch> takeBatches();
+  bool isHolding() const;
+  // Hands over what was held, in order, and holds no more.
+  void release();
+  // Whether a completion is being kept back; the waiting for it may as well end.
+  bool isKeepingBack() const;
+  void deliverKeptBack();
+
+ private:
+  class ObservedJob;
+  struct Shared;
+  struct Held {
+    std::vector<DataPtr> jobs;
+    Completion completion;
+  };
+  void handOver(Held batch);
+  Batch observe(const std::vector<DataPtr>& jobs);
+
+  KXAssetsSaver& inner_;
+  FaultScript& script_;
+  FailureHandler onFailure_;
+  std::shared_ptr<Shared> shared_;
+};
+
+}  // namespace kx
