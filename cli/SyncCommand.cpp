@@ -36,6 +36,12 @@ struct SyncArguments {
   FolderReading reading;
 };
 
+bool changedNothing(const SyncResult& result) {
+  return result.outcome == SyncOutcome::kSynced && result.requested == 0 &&
+         result.deletedAssets == 0 && result.updatedAssets == 0 && result.albumsCreated == 0 &&
+         result.albumsDeleted == 0 && result.albumsRenamed == 0;
+}
+
 // Tells of a sync's end, once: what ends it is either the run itself or, when the run hangs after a
 // signal, the process's end on another thread.
 class SyncReport {
@@ -73,7 +79,7 @@ class SyncReport {
 
  private:
   void summarize(const SyncResult& result) {
-    if (result.outcome == SyncOutcome::kNull) {
+    if (result.outcome == SyncOutcome::kNull || changedNothing(result)) {
       context_.console.result("Nothing to do: the device is in line with the host.");
       return;
     }

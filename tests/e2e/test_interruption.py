@@ -1,0 +1,137 @@
+"""Runs that meet another run, a signal or a full disk."""
+
+import fcntl
+import json
+import os
+import shutil
+import signal
+import subprocess
+import time
+import unittest
+
+from harness import (EndToEnd, KXSYNC, album, asset, environment, finish, jpeg, kxsync, snapshot,
+                     start, uid)
+
+MANY = 3000
+WAIT_SECONDS = 120
+
+
+class Running(EndToEnd):
+
+    def many(self, count=MANY):
+        members = [uid(number) for number in range(count)]
+        root = snapshot([album(uid("a"), "All", members)] +
+                        [asset(member, latitude=1.5, longitude=2.5) for member in members])
+        self.bundle(root)
+
+    def start_and_reach_transfers(self):
+        """A running sync that has imported something, and is far from its end."""
+        process = start("sync", self.host, self.device, "--json")
+        self.addCleanup(process.stderr.close)
+        self.addCleanup(process.stdout.close)
+        self.addCleanup(process.kill)
+        synced = os.path.join(self.device, "var/mobile/Media/PhotoData/SyncedAssets")
+        until = time.monotonic() + WAIT_SECONDS
+        while not any(files for _, _, files in os.walk(synced)):
+            self.assertIsNone(process.poll(), "it ended before anything was imported")
+            self.assertLess(time.monotonic(), until)
+        return process
+
+    def test_signal_ends_it_within_two_seconds_and_it_goes_on_from_there(self):
+        for number, code in ((signal.SIGINT, 130), (signal.SIGTERM, 143)):
+            with self.subTest(signal=number):
+                shutil.rmtree(self.device, ignore_errors=True)
+                self.many()
+                process = self.start_and_reach_transfers()
+                process.send_signal(number)
+                sent = time.monotonic()
+                done = finish(process)
+                self.assertLess(time.monotonic() - sent, 2.5)
+                self.assertEqual(done.code, code, str(done))
+                result = json.loads(done.out)
+                self.assertEqual(result["outcome"], "stopped")
+                self.assertIsNotNone(result["error"])
+                dump = self.dump()
+                there = [identifier for identifier, entry in dump["assets"].items()
+                         if not entry["incomplete"]]
+                self.assertGreater(len(there), 0)
+                self.assertLess(len(there), MANY)
+                self.assertFalse(dump["lastSynced"])
+                result = self.sync()
+                self.assertEqual(result["requested"], MANY - len(there), "nothing is moved twice")
+                dump = self.dump()
+                self.assert_whole(dump)
+                self.assertEqual(len(dump["assets"]), MANY)
+                self.assertEqual(self.sync()["outcome"], "null")
+
+    def test_second_run_names_the_holder_and_reading_goes_on(self):
+        self.many()
+        process = self.start_and_reach_transfers()
+        done = kxsync("sync", self.host, self.device)
+        reading = kxsync("status", self.device), kxsync("dump", self.device)
+        self.assertIsNone(process.poll(), "the first run still holds the device")
+        self.assert_clear_failure(done, 7, str(process.pid))
+        for reader in reading:
+            self.assertEqual((reader.code, reader.err), (0, ""))
+        result = json.loads(kxsync("sync", self.host, self.device, "--json").out)
+        self.assertEqual(result["outcome"], "failed")
+        self.assertIn(str(process.pid), result["error"]["message"])
+        self.assertEqual(finish(process).code, 0)
+        self.assertEqual(self.sync()["outcome"], "null")
+
+    def test_kill_and_go_on(self):
+        self.many()
+        process = self.start_and_reach_transfers()
+        process.kill()
+        process.wait()
+        result = self.sync()
+        self.assertGreater(result["requested"], 0)
+        dump = self.dump()
+        self.assert_whole(dump)
+        self.assertEqual(len(dump["assets"]), MANY)
+        self.assertEqual(dump["albums"][0]["assets"], [uid(number) for number in range(MANY)])
+        self.assertEqual(self.sync()["outcome"], "null")
+
+
+def can_mount():
+    done = subprocess.run(["unshare", "-rm", "mount", "-t", "tmpfs", "none", "/mnt"],
+                          capture_output=True, check=False)
+    return done.returncode == 0
+
+
+@unittest.skipUnless(can_mount(), "needs a mount namespace of its own")
+class FullDisk(EndToEnd):
+
+    SCRIPT = """
+set -e
+mount -t tmpfs -o size=$1 none "$2"
+shift
+set +e
+"$0" sync "$2" "$1" --json; first=$?
+mount -o remount,size=400m "$1"
+"$0" sync "$2" "$1" --json; second=$?
+"$0" dump "$1" --json
+exit $((first * 10 + second))
+"""
+
+    def test_full_disk_says_so_and_goes_on_once_there_is_room(self):
+        count = 40
+        items = [asset(uid(number)) for number in range(count)]
+        media = {uid(number): jpeg() + bytes([number]) * 1_000_000 for number in range(count)}
+        self.bundle(snapshot(items), media=media)
+        os.makedirs(self.device)
+        for size in ("1m", "70m", "90m"):
+            with self.subTest(size=size):
+                done = subprocess.run(
+                    ["unshare", "-rm", "sh", "-c", self.SCRIPT, KXSYNC, size, self.device,
+                     self.host], capture_output=True, text=True, env=environment(), check=False)
+                self.assertEqual(done.returncode, 60, done.stdout[:2000] + done.stderr)
+                first, second, dump = map(json.loads, done.stdout.splitlines())
+                self.assertIn(first["outcome"], ("failed", "partial", "stopped"))
+                self.assertRegex(first["error"]["message"], "space|full|room")
+                self.assertEqual(second["outcome"], "synced")
+                self.assertEqual(len(dump["assets"]), count)
+
+
+if __name__ == "__main__":
+    unittest.main()
