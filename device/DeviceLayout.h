@@ -18,6 +18,8 @@ inline constexpr const char* kDatabase = "/var/mobile/Media/PhotoData/Photos.sql
 inline constexpr const char* kLock = "/var/mobile/Media/PhotoData/Photos.lock";
 inline constexpr const char* kRestoreContext =
     "/var/mobile/Media/PhotoData/Caches/restoreContext.plist";
+// There while a restore from backup is under way, with the backup's identity.
+inline constexpr const char* kRestoreMarker = "/var/mobile/Media/PhotoData/RestoreMarker.plist";
 inline constexpr const char* kSync = "/var/mobile/Media/Photos/Sync";
 inline constexpr const char* kSnapshot = "/var/mobile/Media/Photos/Sync/PhotoLibrary.plist";
 inline constexpr const char* kLastSynced =

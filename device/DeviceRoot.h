@@ -26,6 +26,8 @@ class UniqueFd {
   int get() const { return fd_; }
   explicit operator bool() const { return fd_ >= 0; }
   void reset();
+  // Gives the descriptor away unclosed.
+  int release() { return std::exchange(fd_, -1); }
   // Closes and tells whether that went well: errno, or 0.
   [[nodiscard]] int close();
 
@@ -77,8 +79,8 @@ class DeviceRoot {
   [[nodiscard]] int resolve(const std::string& path, int flags, mode_t mode, UniqueFd* out) const;
   [[nodiscard]] int openParent(const std::string& path, UniqueFd* parent, std::string* leaf) const;
 
-  UniqueFd fd_;
-  std::string hostPath_;
+  const UniqueFd fd_;
+  const std::string hostPath_;
 };
 
 }  // namespace kx

@@ -1,0 +1,58 @@
+#include "device/AssetOrder.h"
+
+#include <cerrno>
+
+#include "device/DeviceErrors.h"
+#include "device/DeviceLayout.h"
+#include "platform/foundation/PropertyList.h"
+
+namespace kx {
+namespace {
+
+// FNV-1a, which stays the same from run to run: tags are kept in the database.
+void mix(std::uint64_t* hash, std::uint8_t byte) { *hash = (*hash ^ byte) * 0x100000001b3ULL; }
+
+}  // namespace
+
+AssetOrder::Album::Album(DictionaryView indexes) : indexes_(std::move(indexes)) {
+  std::uint64_t hash = 0xcbf29ce484222325ULL;
+  for (std::size_t i = 0; i < indexes_->size(); ++i) {
+    for (const char c : indexes_->keyAt(i)) mix(&hash, static_cast<std::uint8_t>(c));
+    const Value value = indexes_->valueAt(i);
+    const std::uint64_t index = value.isNumber() ? value.numberValue().uint64Value() : 0;
+    for (int shift = 0; shift < 64; shift += 8)
+      mix(&hash, static_cast<std::uint8_t>(index >> shift));
+  }
+  tag_ = static_cast<std::int64_t>(hash | 1U);
+}
+
+std::optional<std::int64_t> AssetOrder::Album::indexOf(std::string_view assetUUID) const {
+  if (!indexes_) return std::nullopt;
+  const Value value = indexes_->find(assetUUID);
+  if (!value.isNumber()) return std::nullopt;
+  return value.numberValue().int64Value();
+}
+
+std::shared_ptr<const AssetOrder::Album> AssetOrder::album(const std::optional<std::string>& uuid) {
+  if (stale_.exchange(false, std::memory_order_acquire)) read();
+  if (!uuid) return none_;
+  if (const auto known = albums_.find(*uuid); known != albums_.end()) return known->second;
+  const Value order = orders_[*uuid];
+  if (!order.isDictionary()) return none_;
+  return albums_.emplace(*uuid, std::make_shared<const Album>(order.dictionaryValue()))
+      .first->second;
+}
+
+void AssetOrder::read() {
+  albums_.clear();
+  orders_ = Value();
+  std::vector<std::uint8_t> bytes;
+  const int failed = root_->readFile(device_paths::kAssetOrder, &bytes);
+  if (failed == ENOENT) return;
+  ErrorPtr error = failed == 0 ? nullptr : posixError(device_paths::kAssetOrder, failed);
+  if (failed == 0)
+    orders_ = readPropertyList(std::make_shared<const Data>(std::move(bytes)), &error);
+  if (error) log_.failure("the asset order file is passed over", error);
+}
+
+}  // namespace kx

@@ -1,0 +1,38 @@
+#pragma once
+
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "device/DeviceRoot.h"
+#include "platform/files/FileSystem.h"
+
+namespace kx {
+
+// The device's files beneath its root. Any thread. A read-only one refuses every change (EROFS).
+class DeviceFileSystem : public FileSystem {
+ public:
+  DeviceFileSystem(std::shared_ptr<DeviceRoot> root, bool readOnly)
+      : root_(std::move(root)), readOnly_(readOnly) {}
+
+  bool fileExists(const std::string& path) override;
+  DataPtr readFile(const std::string& path, ErrorPtr* error) override;
+  bool writeFileAtomically(const std::string& path, std::span<const std::uint8_t> bytes,
+                           ErrorPtr* error) override;
+  bool removeItem(const std::string& path, ErrorPtr* error) override;
+  bool createDirectoryWithIntermediates(const std::string& path, ErrorPtr* error) override;
+  std::vector<std::string> contentsOfDirectory(const std::string& path, ErrorPtr* error) override;
+  void enumerate(const std::string& path, const EntryHandler& onEntry,
+                 const ErrorHandler& onError) override;
+  std::string resourceIdentifier(const std::string& path) override;
+  std::uint32_t blockSize(const std::string& path, ErrorPtr* error) override;
+  LockAttempt tryLock(const std::string& path) override;
+
+ private:
+  bool done(const std::string& path, int errorNumber, ErrorPtr* error) const;
+
+  const std::shared_ptr<DeviceRoot> root_;
+  const bool readOnly_;
+};
+
+}  // namespace kx

@@ -1,0 +1,365 @@
+#include <algorithm>
+
+#include "device/DeviceErrors.h"
+#include "device/LibraryContext.h"
+
+namespace kx {
+namespace {
+
+// As a list that SQLite's json_each takes apart.
+std::string jsonList(const std::vector<int>& numbers) {
+  std::string text = "[";
+  for (const int number : numbers) {
+    if (text.size() > 1) text += ',';
+    text += std::to_string(number);
+  }
+  return text + "]";
+}
+
+bool matches(const AssetPredicate& predicate, std::int32_t type) {
+  return (type == predicate.savedAssetType) ==
+         (predicate.comparison == AssetPredicate::Comparison::kSavedAssetTypeEquals);
+}
+
+bool rowIsBefore(const KXGenericAlbumPtr& a, const KXGenericAlbumPtr& b) {
+  return static_cast<const StoredAlbum&>(*a).rowId() < static_cast<const StoredAlbum&>(*b).rowId();
+}
+
+// Runs a fetch; a failure becomes an error value and is noted.
+template <typename Result, typename Fetch>
+std::optional<Result> fetched(LibraryStore& store, ErrorPtr* error, const Fetch& fetch) {
+  try {
+    return fetch();
+  } catch (const SqliteError& failure) {
+    const ErrorPtr why = failure.asError();
+    store.health().noteFailure("a fetch failed", why);
+    setError(error, why);
+    return std::nullopt;
+  }
+}
+
+bool wantsEqual(const AssetPredicate& predicate) {
+  return predicate.comparison == AssetPredicate::Comparison::kSavedAssetTypeEquals;
+}
+
+std::vector<std::int64_t> sizes(SqliteStatement& row) {
+  std::vector<std::int64_t> found;
+  while (row.step()) found.push_back(row.integerAt(0));
+  return found;
+}
+
+}  // namespace
+
+std::optional<std::vector<KXManagedAssetPtr>> LibraryContext::fetchAssets(
+    const AssetFetchRequest& request, ErrorPtr* error) {
+  using Assets = std::vector<KXManagedAssetPtr>;
+  return fetched<Assets>(*store_, error, [&] {
+    Assets assets;
+    readAssets(request.predicate, &assets);
+    if (request.prefetchFaces) prefetchFaces(assets);
+    if (request.prefetchAlbums) prefetchAlbums(assets);
+    return assets;
+  });
+}
+
+void LibraryContext::readAssets(const AssetPredicate& predicate,
+                                std::vector<KXManagedAssetPtr>* assets) {
+  // The whole table is read in its own order: a detour over the index would cost more.
+  const char* const sql =
+      wantsEqual(predicate)
+          ? "SELECT pk, uuid, saved_type, is_video, incomplete, modification_date, sort_token, "
+            "latitude, longitude FROM assets WHERE +saved_type = ? ORDER BY pk"
+          : "SELECT pk, uuid, saved_type, is_video, incomplete, modification_date, sort_token, "
+            "latitude, longitude FROM assets WHERE +saved_type <> ? ORDER BY pk";
+  SqliteStatement row(store_->database(), sql);
+  row.integer(predicate.savedAssetType);
+  while (row.step()) {
+    std::shared_ptr<StoredAsset> object = asset(row.integerAt(0));
+    if (!object->loaded_) object->load(readAssetRow(row, 1));
+    if (!object->isDeleted() && matches(predicate, object->savedAssetType())) {
+      assets->push_back(std::move(object));
+    }
+  }
+  bool late = false;
+  for (const auto& [pk, object] : changedAssets_) {
+    if (!object->exists() || matches(predicate, object->saved().savedType)) continue;
+    if (!matches(predicate, object->savedAssetType())) continue;
+    assets->push_back(object);
+    late = true;
+  }
+  if (!late) return;
+  std::sort(assets->begin(), assets->end(), [](const auto& a, const auto& b) {
+    return static_cast<const StoredAsset&>(*a).pk_ < static_cast<const StoredAsset&>(*b).pk_;
+  });
+}
+
+void LibraryContext::prefetchFaces(const std::vector<KXManagedAssetPtr>& assets) {
+  SqliteStatement row(store_->database(),
+                      "SELECT asset, pk, identifier, x, y, width, height, album_uuid FROM faces "
+                      "ORDER BY asset, pk");
+  bool more = row.step();
+  for (const KXManagedAssetPtr& object : assets) {
+    StoredAsset& owner = static_cast<StoredAsset&>(*object);
+    while (more && row.integerAt(0) < owner.pk_) more = row.step();
+    if (owner.facesRead_ || owner.relationsChanged_) continue;
+    owner.faces_.clear();
+    for (; more && row.integerAt(0) == owner.pk_; more = row.step()) {
+      const std::shared_ptr<StoredFace> found = face(row.integerAt(1), owner.pk_);
+      if (!found->row_) found->load(readFaceRow(row, 2));
+      owner.faces_.push_back(found);
+    }
+    owner.facesRead_ = true;
+  }
+}
+
+void LibraryContext::prefetchAlbums(const std::vector<KXManagedAssetPtr>& assets) {
+  {
+    SqliteStatement row(store_->database(),
+                        "SELECT pk, uuid, kind, title, pending_type, pending_count, managed "
+                        "FROM albums ORDER BY pk");
+    while (row.step()) album(row.integerAt(0), row, 1);
+  }
+  SqliteStatement row(store_->database(),
+                      "SELECT asset, album FROM memberships ORDER BY asset, album");
+  bool more = row.step();
+  for (const KXManagedAssetPtr& object : assets) {
+    StoredAsset& owner = static_cast<StoredAsset&>(*object);
+    while (more && row.integerAt(0) < owner.pk_) more = row.step();
+    if (owner.relationsChanged_) continue;
+    owner.albums_.clear();
+    for (; more && row.integerAt(0) == owner.pk_; more = row.step()) {
+      const std::shared_ptr<StoredAlbum>& holder = albums_[row.integerAt(1)];
+      if (!holder->isDeleted()) owner.albums_.push_back(holder);
+    }
+    owner.albumsRead_ = true;
+    owner.albumsEpoch_ = albumsEpoch_;
+  }
+}
+
+std::optional<std::uint64_t> LibraryContext::countAssets(const AssetPredicate& predicate,
+                                                         ErrorPtr* error) {
+  return fetched<std::uint64_t>(*store_, error, [&] {
+    SqliteStatement row(store_->database(),
+                        wantsEqual(predicate)
+                            ? "SELECT count(*) FROM assets WHERE saved_type = ?"
+                            : "SELECT count(*) FROM assets WHERE saved_type <> ?");
+    row.integer(predicate.savedAssetType);
+    std::int64_t count = row.step() ? row.integerAt(0) : 0;
+    for (const auto& [pk, object] : changedAssets_) {
+      const bool counted = matches(predicate, object->saved().savedType);
+      const bool counts = !object->isDeleted() && matches(predicate, object->savedAssetType());
+      count += static_cast<int>(counts) - static_cast<int>(counted);
+    }
+    return static_cast<std::uint64_t>(count);
+  });
+}
+
+std::optional<std::vector<std::int64_t>> LibraryContext::originalFileSizes(
+    const AssetPredicate& predicate, ErrorPtr* error) {
+  return fetched<std::vector<std::int64_t>>(*store_, error, [&] {
+    SqliteStatement row(
+        store_->database(),
+        wantsEqual(predicate)
+            ? "SELECT t.original_file_size FROM additional_attributes t JOIN assets "
+              "a ON a.pk = t.asset WHERE t.original_file_size IS NOT NULL AND "
+              "a.saved_type = ? ORDER BY t.asset"
+            : "SELECT t.original_file_size FROM additional_attributes t JOIN assets "
+              "a ON a.pk = t.asset WHERE t.original_file_size IS NOT NULL AND "
+              "a.saved_type <> ? ORDER BY t.asset");
+    row.integer(predicate.savedAssetType);
+    return sizes(row);
+  });
+}
+
+std::optional<std::vector<std::int64_t>> LibraryContext::sidecarFileSizes(
+    const AssetPredicate& predicate, ErrorPtr* error) {
+  return fetched<std::vector<std::int64_t>>(*store_, error, [&] {
+    SqliteStatement row(store_->database(),
+                        wantsEqual(predicate)
+                            ? "SELECT t.compressed_size FROM sidecar_files t JOIN assets a "
+                              "ON a.pk = t.asset WHERE t.compressed_size IS NOT NULL AND "
+                              "a.saved_type = ? ORDER BY t.pk"
+                            : "SELECT t.compressed_size FROM sidecar_files t JOIN assets a "
+                              "ON a.pk = t.asset WHERE t.compressed_size IS NOT NULL AND "
+                              "a.saved_type <> ? ORDER BY t.pk");
+    row.integer(predicate.savedAssetType);
+    return sizes(row);
+  });
+}
+
+std::vector<KXGenericAlbumPtr> LibraryContext::albumsOfKinds(const std::vector<int>& kinds) {
+  const auto wanted = [&](const StoredAlbum& album) {
+    return !album.isDeleted() &&
+           std::find(kinds.begin(), kinds.end(), album.kindValue()) != kinds.end();
+  };
+  std::vector<KXGenericAlbumPtr> found;
+  const std::string list = jsonList(kinds);
+  SqliteStatement row(store_->database(),
+                      "SELECT pk, uuid, kind, title, pending_type, pending_count, managed "
+                      "FROM albums WHERE kind IN (SELECT value FROM json_each(?))");
+  row.text(list);
+  while (row.step()) {
+    const RowId pk = row.integerAt(0);
+    const std::shared_ptr<StoredAlbum> object = album(pk, row, 1);
+    // Changed ones are looked at below.
+    if (!changedAlbums_.contains(pk) && wanted(*object)) found.push_back(object);
+  }
+  for (const auto& [pk, object] : changedAlbums_) {
+    if (object->exists() && wanted(*object)) found.push_back(object);
+  }
+  std::sort(found.begin(), found.end(), rowIsBefore);
+  return found;
+}
+
+std::optional<std::vector<KXGenericAlbumPtr>> LibraryContext::fetchEmptyAlbums(
+    const std::vector<int>& kinds, ErrorPtr* error) {
+  using Albums = std::vector<KXGenericAlbumPtr>;
+  return fetched<Albums>(*store_, error, [&] {
+    Albums found;
+    if (memberships_.empty() && changedAssets_.empty() && changedAlbums_.empty()) {
+      const std::string list = jsonList(kinds);
+      SqliteStatement row(store_->database(),
+                          "SELECT pk, uuid, kind, title, pending_type, pending_count, managed "
+                          "FROM albums WHERE kind IN (SELECT value FROM json_each(?)) AND NOT "
+                          "EXISTS(SELECT 1 FROM memberships m WHERE m.album = pk) ORDER BY pk");
+      row.text(list);
+      while (row.step()) found.push_back(album(row.integerAt(0), row, 1));
+      return found;
+    }
+    for (const KXGenericAlbumPtr& candidate : albumsOfKinds(kinds)) {
+      if (isEmptyNow(static_cast<const StoredAlbum&>(*candidate).rowId())) {
+        found.push_back(candidate);
+      }
+    }
+    return found;
+  });
+}
+
+// With what is unsaved taken into account.
+bool LibraryContext::isEmptyNow(RowId albumRow) {
+  const auto alive = [&](RowId assetRow) {
+    const auto changed = changedAssets_.find(assetRow);
+    return changed == changedAssets_.end() || !changed->second->isDeleted();
+  };
+  for (const auto& [key, member] : memberships_) {
+    if (member && key.second == albumRow && alive(key.first)) return false;
+  }
+  SqliteStatement row(store_->database(), "SELECT asset FROM memberships WHERE album = ?");
+  row.integer(albumRow);
+  while (row.step()) {
+    const RowId assetRow = row.integerAt(0);
+    const auto unsaved = memberships_.find({assetRow, albumRow});
+    const bool leaves = unsaved != memberships_.end() && !unsaved->second;
+    if (!leaves && alive(assetRow)) return false;
+  }
+  return true;
+}
+
+KXGenericAlbumPtr LibraryContext::albumWithRole(std::string_view role) {
+  SqliteStatement row(store_->database(), "SELECT pk FROM albums WHERE role = ?");
+  row.text(role);
+  return row.step() ? album(row.integerAt(0)) : nullptr;
+}
+
+KXGenericAlbumPtr LibraryContext::insertAlbum(std::int32_t kind, ListId list) {
+  const std::shared_ptr<StoredAlbum> object = album(store_->newAlbumId());
+  AlbumRow row;
+  row.kind = kind;
+  object->load(std::move(row));
+  object->insertedInto_ = list;
+  noteChanged(*object);
+  return object;
+}
+
+KXGenericAlbumPtr LibraryContext::albumWithUUID(std::string_view uuid) {
+  SqliteStatement row(store_->database(), "SELECT pk FROM albums WHERE uuid = ? ORDER BY pk");
+  row.text(uuid);
+  while (row.step()) {
+    const std::shared_ptr<StoredAlbum> object = album(row.integerAt(0));
+    if (object->exists() && object->uuid() == OptionalString(uuid)) return object;
+  }
+  for (const auto& [pk, object] : changedAlbums_) {
+    if (object->exists() && object->uuid() == OptionalString(uuid)) return object;
+  }
+  return nullptr;
+}
+
+std::shared_ptr<StoredAsset> LibraryContext::assetWithUUID(std::string_view uuid) {
+  SqliteStatement row(store_->database(), "SELECT pk FROM assets WHERE uuid = ?");
+  row.text(uuid);
+  if (row.step()) {
+    const std::shared_ptr<StoredAsset> object = asset(row.integerAt(0));
+    if (object->exists() && object->uuid() == OptionalString(uuid)) return object;
+  }
+  for (const auto& [pk, object] : changedAssets_) {
+    if (object->exists() && object->uuid() == OptionalString(uuid)) return object;
+  }
+  return nullptr;
+}
+
+std::vector<std::pair<std::string, std::string>> LibraryContext::pathsForAllIncompleteAssets() {
+  std::vector<std::pair<std::string, std::string>> found;
+  SqliteStatement row(store_->database(),
+                      "SELECT uuid, path FROM assets WHERE incomplete = 1 ORDER BY pk");
+  while (row.step()) found.emplace_back(row.textAt(0), row.textAt(1));
+  return found;
+}
+
+std::shared_ptr<KXManagedAlbumList> LibraryContext::list(ListId id) {
+  return lists_[static_cast<int>(id) - 1];
+}
+
+std::vector<std::shared_ptr<KXManagedObject>> LibraryContext::registeredObjects() {
+  std::vector<std::shared_ptr<KXManagedObject>> objects;
+  objects.reserve(assets_.size() + faces_.size() + albums_.size());
+  const auto append = [&](const auto& registered) {
+    std::vector<RowId> rows;
+    rows.reserve(registered.size());
+    for (const auto& entry : registered) rows.push_back(entry.first);
+    std::sort(rows.begin(), rows.end());
+    for (const RowId pk : rows) objects.push_back(registered.at(pk));
+  };
+  append(assets_);
+  append(faces_);
+  append(albums_);
+  return objects;
+}
+
+void LibraryContext::refreshObject(const std::shared_ptr<KXManagedObject>& object,
+                                   bool mergeChanges) {
+  if (const auto known = std::dynamic_pointer_cast<StoredAsset>(object)) {
+    if (known->context_ != this) return;
+    if (!mergeChanges) dropChangesOf(*known);
+    known->fault();
+  } else if (const auto album = std::dynamic_pointer_cast<StoredAlbum>(object)) {
+    if (album->context_ != this) return;
+    if (!mergeChanges && !album->insertedInto_) {
+      album->drop();
+      changedAlbums_.erase(album->pk_);
+    }
+    album->fault();
+  } else if (const auto face = std::dynamic_pointer_cast<StoredFace>(object)) {
+    if (face->context_ == this && !face->inserted_) face->row_.reset();
+  }
+}
+
+void LibraryContext::dropChangesOf(StoredAsset& asset) {
+  asset.drop();
+  changedAssets_.erase(asset.pk_);
+  memberships_.erase(memberships_.lower_bound({asset.pk_, 0}),
+                     memberships_.lower_bound({asset.pk_ + 1, 0}));
+  const auto first = changedFaces_.lower_bound({asset.pk_, 0});
+  const auto last = changedFaces_.lower_bound({asset.pk_ + 1, 0});
+  for (auto entry = first; entry != last; ++entry) {
+    StoredFace& face = *entry->second;
+    if (face.inserted_) {
+      face.die();
+      faces_.erase(face.pk_);
+    } else {
+      face.life_ = StoredFace::Life::kLive;
+    }
+  }
+  changedFaces_.erase(first, last);
+}
+
+}  // namespace kx

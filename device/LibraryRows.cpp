@@ -1,0 +1,41 @@
+#include "device/LibraryRows.h"
+
+#include "device/Sqlite.h"
+
+namespace kx {
+
+AssetRow readAssetRow(const SqliteStatement& row, int first) {
+  AssetRow asset;
+  asset.uuid = row.textAt(first);
+  asset.savedType = static_cast<std::int32_t>(row.integerAt(first + 1));
+  asset.isVideo = row.integerAt(first + 2) != 0;
+  asset.incomplete = row.integerAt(first + 3) != 0;
+  asset.modificationDate = row.optionalRealAt(first + 4);
+  asset.sortToken = row.optionalRealAt(first + 5);
+  if (!row.isNull(first + 6)) {
+    asset.location = Coordinate{row.realAt(first + 6), row.realAt(first + 7)};
+  }
+  return asset;
+}
+
+FaceRow readFaceRow(const SqliteStatement& row, int first) {
+  FaceRow face;
+  face.identifier = static_cast<std::uint16_t>(row.integerAt(first));
+  face.relativeRect = Rect{row.realAt(first + 1), row.realAt(first + 2), row.realAt(first + 3),
+                           row.realAt(first + 4)};
+  face.albumUUID = row.optionalTextAt(first + 5);
+  return face;
+}
+
+AlbumRow readAlbumRow(const SqliteStatement& row, int first) {
+  AlbumRow album;
+  album.uuid = row.optionalTextAt(first);
+  album.kind = static_cast<std::int32_t>(row.integerAt(first + 1));
+  album.title = row.optionalTextAt(first + 2);
+  album.pendingType = static_cast<std::int32_t>(row.integerAt(first + 3));
+  album.pendingCount = static_cast<std::uint32_t>(row.integerAt(first + 4));
+  album.managed = row.integerAt(first + 5) != 0;
+  return album;
+}
+
+}  // namespace kx

@@ -1,0 +1,92 @@
+#pragma once
+
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <optional>
+#include <stdexcept>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+#include "device/AssetOrder.h"
+#include "device/DeviceAdmin.h"
+#include "device/LibraryRows.h"
+#include "device/ReferenceDevice.h"
+#include "device/Sqlite.h"
+
+namespace kx {
+
+// A failure of the device with its error value.
+class DeviceFailure : public std::runtime_error {
+ public:
+  explicit DeviceFailure(ErrorPtr error)
+      : std::runtime_error(error->description()), error_(std::move(error)) {}
+  const ErrorPtr& error() const { return error_; }
+
+ private:
+  ErrorPtr error_;
+};
+
+// Writes rows inside one transaction and notes what it changes. Made by LibraryStore::write, used
+// on the library's queue. Failures raise SqliteError or DeviceFailure.
+class LibraryWriter {
+ public:
+  LibraryWriter(SqliteDatabase& database, AssetOrder& order) : database_(database), order_(order) {}
+
+  void insertAlbum(RowId pk, const AlbumRow& album, std::optional<ListId> list);
+  void updateAlbum(RowId pk, const AlbumRow& before, const AlbumRow& after);
+  void deleteAlbum(RowId pk, const AlbumRow& album);
+  // Not below zero. Unknown albums are passed over.
+  void lowerPendingCount(RowId album, std::uint32_t by);
+
+  RowId insertAsset(const WholeAssetRow& asset);
+  // Everything of the row but its number; faces, memberships and sizes go.
+  void replaceAsset(RowId pk, const WholeAssetRow& asset);
+  void updateAsset(RowId pk, const DeviceAssetFields& fields);
+  void deleteAsset(RowId pk);
+  void setOriginalFileSize(RowId asset, std::int64_t bytes);
+  void insertSidecar(RowId asset, std::int64_t compressedBytes);
+  void insertAssetFile(RowId asset, std::int64_t ordinal, const std::string& path);
+
+  void insertFace(RowId pk, RowId asset, const FaceRow& face);
+  void deleteFace(RowId pk, RowId asset);
+
+  // At the place that the asset order file gives; once, however often.
+  void addMembership(RowId album, RowId asset, std::string_view assetUUID);
+  // At the end of an album whose order is its owner's.
+  void appendMembership(RowId album, RowId asset, std::int64_t position);
+  void removeMembership(RowId album, RowId asset);
+  void sortAlbum(RowId album);
+
+  void setListOrder(ListId list, const std::vector<RowId>& order);
+  // Puts an album that stands in the list at that place.
+  void moveInList(ListId list, RowId album, std::size_t index);
+
+  // Files that nobody names any more once this is committed.
+  void releaseFile(std::string path) { releasedFiles_.push_back(std::move(path)); }
+
+  SqliteDatabase& database() { return database_; }
+  RowChanges& rows() { return rows_; }
+  LibraryChanges& changes() { return changes_; }
+  std::vector<std::string>& releasedFiles() { return releasedFiles_; }
+
+ private:
+  struct AlbumOrderState {
+    std::shared_ptr<const AssetOrder::Album> order;
+    bool current = false;  // positions are those of `order`
+  };
+  AlbumOrderState& orderState(RowId album);
+  void renumber(RowId album, const AssetOrder::Album& order);
+  std::vector<RowId> listMembers(ListId list);
+
+  SqliteDatabase& database_;
+  AssetOrder& order_;
+  std::map<RowId, AlbumOrderState> orderStates_;
+  RowChanges rows_;
+  LibraryChanges changes_;
+  std::vector<std::string> releasedFiles_;
+};
+
+}  // namespace kx

@@ -1,0 +1,77 @@
+#pragma once
+
+#include <atomic>
+#include <map>
+#include <memory>
+#include <optional>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "device/DeviceFileSystem.h"
+#include "device/LibraryStore.h"
+#include "device/MediaFolders.h"
+#include "device/MediaStore.h"
+#include "platform/dispatch/Dispatch.h"
+#include "platform/library/KXAssetsSaver.h"
+
+namespace kx {
+
+// The asset daemon: works the jobs it is handed one hand-over after the other on a thread of its
+// own; its transactions run on the library's queue, its completions on a third. Public operations
+// from any thread, they return at once.
+class Quarryd {
+ public:
+  struct Parts {
+    std::shared_ptr<DeviceRoot> root;
+    std::shared_ptr<LibraryStore> store;
+    std::unique_ptr<MediaStore> media;
+    std::size_t filesPerFolder = 1000;
+  };
+  explicit Quarryd(Parts parts);
+  ~Quarryd();
+
+  void save(std::vector<DataPtr> jobs, KXAssetsSaver::Completion completion);
+  void updateRestoredAsset(std::optional<std::string> uuid, std::vector<std::string> paths);
+  void finalizeRestore(bool recreateAlbums);
+  // Files below the synced-assets directory that no row names any more.
+  void removeFiles(std::vector<std::string> paths);
+  // Whether a file that had to go is still there.
+  bool leftFilesBehind() const { return leftFilesBehind_; }
+  // Waits until there is nothing to do.
+  void drain();
+
+ private:
+  struct Import;
+  struct HandOver;
+
+  void work(HandOver& handOver, const std::vector<DataPtr>& jobs);
+  void workJob(HandOver& handOver, const DataPtr& job);
+
+  // Imports.
+  void importAll(HandOver& handOver);
+  [[nodiscard]] ErrorPtr prepare(Import& import);
+  [[nodiscard]] ErrorPtr checkSource(const std::string& path);
+  [[nodiscard]] ErrorPtr findRows(std::vector<Import>& imports);
+  [[nodiscard]] ErrorPtr placeFile(Import& import);
+  [[nodiscard]] ErrorPtr commit(std::vector<Import>& imports);
+  void writeImport(LibraryWriter& writer, const Import& import,
+                   std::map<RowId, std::uint32_t>& arrived);
+  void fail(const Import& import, const ErrorPtr& why);
+
+  // Clean-up and seal.
+  [[nodiscard]] ErrorPtr cleanUp(const HandOver& handOver, const std::optional<Date>& before);
+  [[nodiscard]] ErrorPtr seal(const std::string& snapshotPath);
+  [[nodiscard]] std::optional<std::string> whyNotWhole(const DataPtr& snapshot);
+
+  void completeRestoredAsset(const std::string& uuid);
+
+  Parts parts_;
+  DeviceFileSystem files_;
+  MediaFolders folders_;
+  std::atomic<bool> leftFilesBehind_{false};
+  DispatchQueuePtr completions_;
+  DispatchQueuePtr work_;  // last: its blocks use the rest
+};
+
+}  // namespace kx

@@ -1,0 +1,287 @@
+#include "device/ReferenceDevice.h"
+
+#include <fcntl.h>
+#include <sys/resource.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <stdexcept>
+
+#include "device/DeviceErrors.h"
+#include "device/DeviceFileSystem.h"
+#include "device/DeviceLayout.h"
+#include "device/DeviceLibrary.h"
+#include "device/DeviceLock.h"
+#include "device/DeviceRecovery.h"
+#include "device/DumpReader.h"
+#include "device/FileMediaStore.h"
+#include "device/HealthRecord.h"
+#include "device/KernelMemoryPressure.h"
+#include "device/LibrarySchema.h"
+#include "device/Quarryd.h"
+#include "device/StoreAdmin.h"
+#include "device/SystemClock.h"
+
+namespace kx {
+namespace {
+
+constexpr const char* kPressureFile = "/proc/pressure/memory";
+constexpr std::size_t kGlobalQueueThreads = 2;
+
+class DeviceSaver : public KXAssetsSaver {
+ public:
+  explicit DeviceSaver(Quarryd* quarryd, DispatchQueuePtr refusals)
+      : quarryd_(quarryd), refusals_(std::move(refusals)) {}
+  KXSyncSaveJobPtr newSyncSaveJob() override { return std::make_shared<KXSyncSaveJob>(); }
+  void saveSyncedAssets(std::vector<DataPtr> jobs, Completion completion) override {
+    if (quarryd_ != nullptr) {
+      quarryd_->save(std::move(jobs), std::move(completion));
+      return;
+    }
+    refusals_->async([completion = std::move(completion)] {
+      if (completion) completion(0, systemError("cannot write", "the library", EROFS));
+    });
+  }
+
+ private:
+  Quarryd* const quarryd_;  // null on a read-only device
+  const DispatchQueuePtr refusals_;
+};
+
+class DevicePorter : public KXPorterClient {
+ public:
+  explicit DevicePorter(Quarryd* quarryd) : quarryd_(quarryd) {}
+  void updateRestoredAssetWithUUID(const std::optional<std::string>& uuid,
+                                   const std::vector<std::string>& paths) override {
+    if (quarryd_ != nullptr) quarryd_->updateRestoredAsset(uuid, paths);
+  }
+  void finalizeOTARestoreRecreatingAlbums(bool recreateAlbums) override {
+    if (quarryd_ != nullptr) quarryd_->finalizeRestore(recreateAlbums);
+  }
+
+ private:
+  Quarryd* const quarryd_;
+};
+
+// Outside a restore nothing is coming back.
+class NoRestore : public QBManager {
+ public:
+  std::optional<std::vector<QBFile>> restoreFilesForDomain(const std::string&, ErrorPtr*) override {
+    return std::vector<QBFile>();
+  }
+};
+
+class StoreDevice : public ReferenceDevice, public Platform {
+ public:
+  explicit StoreDevice(const DeviceOptions& options)
+      : options_(options), log_(options.logs), health_(log_) {}
+  ~StoreDevice() override;
+
+  // Null, or why the device cannot be had.
+  ErrorPtr start();
+
+  // ReferenceDevice
+  Platform& platform() override { return *this; }
+  DeviceHealth& health() override { return health_; }
+  LibraryChanges takeChanges() override { return store_->takeChanges(); }
+  DeviceCounters takeCounters() override { return store_->takeCounters(); }
+  DeviceAdmin& admin() override { return *admin_; }
+  DeviceRoot& root() override { return *root_; }
+  void drain() override;
+  DeviceDump dump(bool hash, ErrorPtr* error) override;
+
+  // Platform
+  Clock& clock() override { return options_.clock != nullptr ? *options_.clock : systemClock_; }
+  FileSystem& files() override { return *files_; }
+  KXPhotoLibraryFramework& photoLibrary() override { return *framework_; }
+  KXAssetsSaver& sharedAssetsSaver() override { return *saver_; }
+  KXPorterClient& porterClient() override { return *porter_; }
+  std::unique_ptr<QBManager> newBackupManager() override { return std::make_unique<NoRestore>(); }
+  LogSinks logs() override { return options_.logs; }
+  std::unique_ptr<MemoryPressureSource> newMemoryPressureSource() override {
+    return std::make_unique<KernelMemoryPressure>(globalQueue_, kPressureFile);
+  }
+  bool isMainThread() override { return ::syscall(SYS_gettid) == ::getpid(); }
+  std::string mobileHomeDirectory() override { return device_paths::kMobileHome; }
+
+ private:
+  ErrorPtr openForReading();
+  ErrorPtr openForWriting();
+  ErrorPtr makeTree();
+  void makeStore(OpenedLibrary library);
+
+  const DeviceOptions options_;
+  const DeviceLog log_;
+  HealthRecord health_;
+  SystemClock systemClock_;
+  std::shared_ptr<DeviceRoot> root_;
+  std::unique_ptr<DeviceLock> lock_;
+  std::shared_ptr<LibraryStore> store_;
+  std::unique_ptr<DeviceFileSystem> files_;
+  std::unique_ptr<DeviceLibraryFramework> framework_;
+  std::unique_ptr<StoreAdmin> admin_;
+  std::unique_ptr<Quarryd> quarryd_;
+  std::unique_ptr<DeviceSaver> saver_;
+  std::unique_ptr<DevicePorter> porter_;
+  DispatchQueuePtr globalQueue_;
+};
+
+ErrorPtr StoreDevice::start() {
+  ErrorPtr error;
+  root_ = DeviceRoot::open(options_.root, options_.create && !options_.readOnly, &error);
+  if (!root_) return error;
+  files_ = std::make_unique<DeviceFileSystem>(root_, options_.readOnly);
+  globalQueue_ = DispatchQueue::concurrent("com.veltro.global.default", kGlobalQueueThreads);
+  if (ErrorPtr failed = options_.readOnly ? openForReading() : openForWriting()) return failed;
+  framework_ = std::make_unique<DeviceLibraryFramework>(store_);
+  admin_ = std::make_unique<StoreAdmin>(root_, store_);
+  saver_ = std::make_unique<DeviceSaver>(quarryd_.get(), globalQueue_);
+  porter_ = std::make_unique<DevicePorter>(quarryd_.get());
+  return nullptr;
+}
+
+ErrorPtr StoreDevice::openForReading() {
+  struct stat status;
+  const int failed = root_->status(device_paths::kDatabase, &status);
+  if (failed == ENOENT || failed == ENOTDIR) {
+    return deviceError(DeviceError::kNotOurs, options_.root + " holds no photo library");
+  }
+  if (failed != 0) return systemError("cannot open", device_paths::kDatabase, failed);
+  ErrorPtr error;
+  OpenedLibrary library =
+      openLibraryForReading(root_->hostPath() + device_paths::kDatabase, &error);
+  if (!library.database) return error;
+  makeStore(std::move(library));
+  return nullptr;
+}
+
+ErrorPtr StoreDevice::makeTree() {
+  using namespace device_paths;
+  for (const char* path : {kTemporary, kDcim, kPhotoData, kCaches, kCascades, kSyncedAssets,
+                           kFaceThumbnails, kSync, kStaging}) {
+    if (const int failed = root_->makeDirectories(path); failed != 0) {
+      return systemError("cannot make", path, failed);
+    }
+  }
+  return nullptr;
+}
+
+ErrorPtr StoreDevice::openForWriting() {
+  struct stat status;
+  const int present = root_->status(device_paths::kDatabase, &status);
+  if (present != 0 && present != ENOENT && present != ENOTDIR) {
+    return systemError("cannot open", device_paths::kDatabase, present);
+  }
+  if (present != 0 && !options_.create) {
+    return deviceError(DeviceError::kNotOurs, options_.root + " holds no photo library");
+  }
+  if (ErrorPtr failed = makeTree()) return failed;
+  ErrorPtr error;
+  lock_ = DeviceLock::take(root_, &error);
+  if (!lock_) return error;
+  if (const int failed = lock_->markInUse(); failed != 0) {
+    return systemError("cannot write", device_paths::kLock, failed);
+  }
+  OpenedLibrary library =
+      openLibraryForWriting(root_->hostPath() + device_paths::kDatabase, &error);
+  if (!library.database) return error;
+  if (library.isNew) {
+    const int failed = root_->remove(device_paths::kLastSynced);
+    if (failed != 0 && failed != ENOENT) {
+      return systemError("cannot remove", device_paths::kLastSynced, failed);
+    }
+  }
+  makeStore(std::move(library));
+  // The store is used by this thread alone until its queue gets its first block.
+  if (ErrorPtr failed = DeviceRecovery(root_, *store_).run(lock_->lastState())) return failed;
+  health_.reset();
+  std::unique_ptr<MediaStore> media = std::make_unique<FileMediaStore>(root_);
+  if (options_.decorateMedia) media = options_.decorateMedia(std::move(media));
+  quarryd_ = std::make_unique<Quarryd>(
+      Quarryd::Parts{root_, store_, std::move(media), options_.filesPerFolder});
+  store_->setFileReleaser(
+      [this](std::vector<std::string> paths) { quarryd_->removeFiles(std::move(paths)); });
+  return nullptr;
+}
+
+void StoreDevice::makeStore(OpenedLibrary library) {
+  LibraryStore::Parts parts;
+  parts.database = std::move(library.database);
+  parts.root = root_;
+  parts.health = &health_;
+  parts.log = &log_;
+  parts.readOnly = options_.readOnly;
+  store_ = std::make_shared<LibraryStore>(std::move(parts));
+}
+
+void StoreDevice::drain() {
+  // Work of the library may give work to quarryd and the other way round.
+  store_->queue().drain();
+  if (quarryd_) quarryd_->drain();
+  store_->queue().drain();
+  if (quarryd_) quarryd_->drain();
+}
+
+DeviceDump StoreDevice::dump(bool hash, ErrorPtr* error) {
+  DeviceDump dump;
+  ErrorPtr failure;
+  const auto read = [&] {
+    try {
+      dump = readDump(store_->database());
+    } catch (const SqliteError& problem) {
+      failure = problem.asError();
+    }
+  };
+  if (store_->queue().isCurrent()) {
+    read();
+  } else {
+    store_->queue().sync(read);
+  }
+  if (failure) {
+    setError(error, failure);
+    return {};
+  }
+  addFilesToDump(*root_, hash, &dump);
+  return dump;
+}
+
+StoreDevice::~StoreDevice() {
+  if (!store_) return;
+  drain();
+  const bool filesLeft = !quarryd_ || quarryd_->leftFilesBehind();
+  store_->queue().sync([this] { store_->setFileReleaser(nullptr); });
+  porter_.reset();
+  saver_.reset();
+  quarryd_.reset();
+  store_->queue().drain();
+  framework_.reset();
+  admin_.reset();
+  // Libraries that are still held keep the store, and with it the database, open.
+  const bool lastUser = store_.use_count() == 1;
+  store_.reset();
+  if (!lock_ || filesLeft || !lastUser) return;
+  if (const int failed = lock_->markClean(CleanState::of(*root_)); failed != 0) {
+    log_.failure("the device is not marked as clean",
+                 systemError("cannot write", device_paths::kLock, failed));
+  }
+}
+
+}  // namespace
+
+std::unique_ptr<ReferenceDevice> ReferenceDevice::open(const DeviceOptions& options,
+                                                       ErrorPtr* error) {
+  try {
+    auto device = std::make_unique<StoreDevice>(options);
+    ErrorPtr failure = device->start();
+    if (!failure) return device;
+    setError(error, std::move(failure));
+  } catch (const SqliteError& problem) {
+    setError(error, problem.asError());
+  } catch (const std::exception& problem) {
+    setError(error, deviceError(DeviceError::kIo, problem.what()));
+  }
+  return nullptr;
+}
+
+}  // namespace kx
