@@ -2,7 +2,6 @@
 
 #include <array>
 
-#include "platform/foundation/Exceptions.h"
 #include "records/KXSUUID.h"
 
 namespace kx {
@@ -78,13 +77,8 @@ KXSAssetPtr KXSAsset::initWithCoder(KeyedUnarchiver& coder) {
   auto asset = makeWithCoder<KXSAsset>(coder);
   asset->decodeFields(coder, archivedKeys());
   asset->fields_.set(kIsVideo, coder.decodeValue(kKXSAssetIsVideoKey));
-  if (const ArchivablePtr object = coder.decodeObject(kKXSAssetPropertiesKey)) {
-    auto properties = std::dynamic_pointer_cast<KXSAssetProperties>(object);
-    if (!properties) {
-      throw TypeError(kKXSAssetPropertiesKey, "KXSAssetProperties", object->archiveClassName());
-    }
-    asset->setProperties(std::move(properties));
-  }
+  asset->setProperties(std::dynamic_pointer_cast<KXSAssetProperties>(
+      coder.decodeObject(kKXSAssetPropertiesKey, "KXSAssetProperties")));
   return asset;
 }
 

@@ -219,7 +219,7 @@ TEST(KXSAsset, DescribesItself) {
   EXPECT_EQ(asset->description(),
             "Asset - (" + std::string(kX) +
                 "), rating: 4, isFlagged: 1, isVideo:YES, caption: By the sea, eventUUID: event, "
-                "adjustments: (null), exposureDate: 3400000000, modificationDate: 3500000000, "
+                "adjustments: (null), exposureDate: 3.4e+09, modificationDate: 3.5e+09, "
                 "latitude: -45.25, longitude: 13.5, originalFileName: IMG_1.JPG, facesInfo: "
                 "(null)");
 }
