@@ -12,23 +12,18 @@
 #include "daemon/SyncJson.h"
 #include "daemon/SyncRunner.h"
 #include "platform/foundation/Text.h"
-#if __has_include("daemon/drive/DriveMain.h")
-#include "daemon/drive/DriveMain.h"
-#define KX_HAS_DRIVE 1
-#else
-#define KX_HAS_DRIVE 0
-#endif
 
 namespace kx {
 namespace {
 
-constexpr const char* kHelp =
+constexpr const char* kUsage =
     R"(ferrule - the sync daemon: loads the sync plug-in and moves files to a device
 
 usage:
   ferrule sync HOST DEVICE [options]   run one whole sync
-  ferrule drive DEVICE                 answer one JSON object a line (see docs/drive.md)
+)";
 
+constexpr const char* kHelp = R"(
 HOST is a host bundle: a directory with PhotoLibrary.plist and media/. (kxsync also reads plain
 folders of photos.) DEVICE is a directory that stands for the device's root; sync makes it.
 
@@ -43,7 +38,6 @@ options of sync:
 examples:
   ferrule sync ./bundle ./device
   ferrule sync --json --log-level info ./bundle ./device
-  echo '{"call":"supportedDataclasses"}' | ferrule drive ./device
 
 exit codes: 0 done, 1 failed, 2 wrong usage, 3 some photos did not make it, 4 stopped by a guard,
 6 no space left on the device, 7 another run holds the device, 130 or 143 ended by a signal
@@ -151,11 +145,13 @@ int runSync(const std::vector<std::string>& arguments) {
 
 }  // namespace
 
-int runFerrule(const std::vector<std::string>& arguments) {
+int runFerrule(const std::vector<std::string>& arguments, const FerruleCommands& further) {
   if (arguments.empty()) return wrongUsage("what to do is missing");
   for (const std::string& argument : arguments) {
     if (argument == "--") break;
     if (argument == "--help" || argument == "-h") {
+      std::fputs(kUsage, stdout);
+      for (const auto& [name, command] : further) std::printf("  %s\n", command.usage.c_str());
       std::fputs(kHelp, stdout);
       return kExitDone;
     }
@@ -169,9 +165,9 @@ int runFerrule(const std::vector<std::string>& arguments) {
   const rlimit noCore{0, 0};
   ::setrlimit(RLIMIT_CORE, &noCore);
   if (arguments[0] == "sync") return runSync(arguments);
-#if KX_HAS_DRIVE
-  if (arguments[0] == "drive") return runDrive(arguments);
-#endif
+  if (const auto found = further.find(arguments[0]); found != further.end()) {
+    return found->second.run(arguments);
+  }
   return wrongUsage("unknown command \"" + arguments[0] + "\"");
 }
 

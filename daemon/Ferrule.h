@@ -1,13 +1,22 @@
 #pragma once
 
+#include <functional>
+#include <map>
 #include <string>
 #include <vector>
 
 namespace kx {
 
-// The daemon's command line without its name: "sync HOST DEVICE", "drive DEVICE", "--help",
-// "--version". Writes to the standard streams and returns the exit code. Call it on the main
-// thread.
-int runFerrule(const std::vector<std::string>& arguments);
+// A sub-command beside sync: its arguments with its own name first, and its exit code.
+struct FerruleCommand {
+  std::string usage;  // a line of the help text: "ferrule drive DEVICE    what it does"
+  std::function<int(const std::vector<std::string>& arguments)> run;
+};
+using FerruleCommands = std::map<std::string, FerruleCommand>;
+
+// The daemon's command line without its name: "sync HOST DEVICE", one of `further`, "--help",
+// "--version". Writes to the standard streams and returns the exit code. Call it on the main thread
+// while it is the only one.
+int runFerrule(const std::vector<std::string>& arguments, const FerruleCommands& further);
 
 }  // namespace kx

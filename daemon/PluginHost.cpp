@@ -78,6 +78,13 @@ std::shared_ptr<PluginModule> PluginModule::load(const std::string& path, ErrorP
   return nullptr;
 }
 
+std::shared_ptr<PluginModule> PluginModule::linkedIn(FRPluginEntry entry) {
+  std::shared_ptr<PluginModule> module(new PluginModule());
+  module->path_ = "linked in";
+  module->entry_ = entry;
+  return module;
+}
+
 std::optional<RaisedException> catchRaised(const std::function<void()>& body) {
   try {
     body();

@@ -19,6 +19,9 @@ class PluginModule {
   // one-line error when there is none or it has no entry point.
   static std::shared_ptr<PluginModule> load(const std::string& path, ErrorPtr* error);
 
+  // A plug-in that is part of this program.
+  static std::shared_ptr<PluginModule> linkedIn(FRPluginEntry entry);
+
   const std::string& path() const { return path_; }
   FRPluginEntry entry() const { return entry_; }
 

@@ -3,6 +3,7 @@
 #include <atomic>
 #include <cstdint>
 #include <functional>
+#include <memory>
 #include <optional>
 #include <string>
 #include <vector>
@@ -12,11 +13,14 @@
 
 namespace kx {
 
+class PluginModule;
+
 struct SyncOptions {
   std::string deviceRoot;     // the directory that the device was opened on
   bool allowDeletes = false;  // lets a sync pass that the guard would stop
   // The plug-in module; empty: KXSYNC_PLUGIN, else beside the program, else where it is installed.
   std::string pluginPath;
+  std::shared_ptr<PluginModule> plugin;  // set: this one, whatever pluginPath says
   // Bytes that must stay free on the device beside what a sync brings.
   std::uint64_t reserveBytes = 64ULL << 20;
 };

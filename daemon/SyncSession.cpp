@@ -84,8 +84,8 @@ bool SyncSession::checkBeforeFirstEffect() {
     error = guardAgainstDeletes(snapshot_.checked, comparison);
   }
   if (!error) error = refuseWithoutSpace(comparison, context_.host, context_.options);
-  std::shared_ptr<PluginModule> module;
-  if (!error) module = PluginModule::load(context_.options.pluginPath, &error);
+  std::shared_ptr<PluginModule> module = context_.options.plugin;
+  if (!error && !module) module = PluginModule::load(context_.options.pluginPath, &error);
   if (!error) {
     plugin_ = std::make_unique<PluginHost>(std::move(module), context_.device.platform());
     error = plugin_->createClient();
