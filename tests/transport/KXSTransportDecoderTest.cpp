@@ -156,7 +156,7 @@ TEST(KXSTransportDecoder, AnUnknownItemTypeRaises) {
 TEST(KXSTransportDecoder, AnItemWithoutIdentifierRaises) {
   for (const char* type : {"Asset", "Album", "Event"}) {
     const Value anonymous = dict({{"itemType", text(type)}});
-    EXPECT_EQ(KXSTransportDecoder().decoder()->_itemFromPropertyList(anonymous)->uuid(),
+    EXPECT_EQ(KXSTransportDecoder::decoder()->_itemFromPropertyList(anonymous)->uuid(),
               std::nullopt);
     EXPECT_THROW(decode(root({anonymous})), InternalInconsistency);
     EXPECT_THROW(decode(throughFile(root({anonymous}))), InternalInconsistency);

@@ -53,6 +53,29 @@ TEST(SnapshotArchive, HoldsItsFourKeys) {
             dict({{"keys", texts({"F"})}, {"objects", list({Value::uid(3)})}})}}));
 }
 
+TEST(SnapshotArchive, IsTheseVeryBytes) {
+  const auto snapshot = KXSLibraryChangeSnapshot::librarySnapshot();
+  snapshot->setLibraryUUID("L");
+  snapshot->setLibraryKind("Folder");
+  snapshot->setDeletes(nullptr);
+  const KXSEventPtr event = KXSEvent::eventWithUUID("E");
+  event->setName("Day");
+  snapshot->updates()->set("E", event);
+  EXPECT_EQ(hexOf(archiveBytes(snapshot)),
+            "62706c6973743030d401020304050607085861726368697665725776657273696f6e5472"
+            "6f6f74576f626a656374735f100f4b584b65796564417263686976657210018000a2091b"
+            "d30a0b0c0d0e1355636c6173735676616c756573546d6170735f10184b58534c69627261"
+            "72794368616e6765536e617073686f74d20f1011125f10264b58534c6962726172794368"
+            "616e6765536e617073686f744c696272617279555549444b65795f10264b58534c696272"
+            "6172794368616e6765536e617073686f744c6962726172794b696e644b6579514c56466f"
+            "6c646572d114155f101c4b58534c696272617279536e617073686f74557064617465734b"
+            "6579d216041719546b657973a1185145a11a8001d20a0b1c1d584b58534576656e74d21e"
+            "1f2018596576656e744e616d6554757569645344617900080011001a00220027002f0041"
+            "004300450048004f0055005c0061007c008100aa00d300d500dc00df00fe01030108010a"
+            "010c010e01100115011e0123012d01320000000000000201000000000000002100000000"
+            "000000000000000000000136");
+}
+
 TEST(SnapshotArchive, NullMapsStayNull) {
   const auto decoded = KXSTransportDecoder::decoder()->decodeSnapshotFromPropertyList(
       dict({{"libraryUUID", text("L")}}), nullptr);
