@@ -26,6 +26,7 @@ class FRAsset {
   const std::optional<std::string>& path() const { return path_; }
   void setPath(std::optional<std::string> path) { path_ = std::move(path); }
   bool isDownload() const { return isDownload_; }
+  void setIsDownload(bool isDownload) { isDownload_ = isDownload; }
   bool isRestore() const { return isRestore_; }
   void setIsRestore(bool isRestore) { isRestore_ = isRestore; }
 

@@ -1,0 +1,42 @@
+#pragma once
+
+#include <memory>
+#include <mutex>
+#include <nlohmann/json.hpp>
+#include <string>
+#include <vector>
+
+#include "platform/sync/FRLog.h"
+
+namespace kx {
+
+// Collects what is logged, at every level, until an answer takes it. Any thread; messages keep the
+// order in which they were logged.
+class DriveLogs {
+ public:
+  // The photo library's log is not collected: it holds nothing that the sync log lacks.
+  LogSinks sinks() const;
+  // [[level, source file, function, text], ...] since the last call.
+  nlohmann::ordered_json takeLog();
+  // What went to the standard log since the last call.
+  nlohmann::ordered_json takeStandardLog();
+
+ private:
+  struct Line {
+    int level;
+    std::string source;
+    std::string function;
+    std::string text;
+  };
+  struct Content {
+    std::mutex mutex;
+    std::vector<Line> lines;
+    std::vector<std::string> standard;
+  };
+  class SyncSink;
+  class StandardSink;
+
+  std::shared_ptr<Content> content_ = std::make_shared<Content>();
+};
+
+}  // namespace kx
