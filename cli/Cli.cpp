@@ -64,6 +64,19 @@ std::string unknownCommand(const CLI::App& app, const std::vector<std::string>& 
   return "";
 }
 
+// What is wrong with a command line that names no command of ours.
+std::string whatIsMissing(const CLI::App& app, const std::vector<std::string>& arguments) {
+  const std::string unknown = unknownCommand(app, arguments);
+  if (!unknown.empty()) return "there is no command \"" + unknown + "\"";
+  for (const std::string& argument : arguments) {
+    if (argument == "--") break;
+    if (argument.front() == '-' && app.get_option_no_throw(argument) == nullptr) {
+      return "there is no option \"" + argument + "\"";
+    }
+  }
+  return "a command is missing";
+}
+
 int reportUsage(Context& context, const std::string& message) {
   reportFailure(context, Error::make(kCliErrorDomain, kExitUsage, message), kExitUsage);
   const std::string program = context.command.empty() ? "kxsync" : "kxsync " + context.command;
@@ -116,9 +129,7 @@ int parseAndPerform(const std::vector<std::string>& arguments, Console& console)
   } catch (const CLI::ParseError& error) {
     parsed.options.json = asksForJson(arguments);
     Context context{command, parsed.options, console};
-    const std::string unknown = unknownCommand(app, arguments);
-    if (!unknown.empty()) return reportUsage(context, "there is no command \"" + unknown + "\"");
-    return reportUsage(context, command.empty() ? "a command is missing" : error.what());
+    return reportUsage(context, command.empty() ? whatIsMissing(app, arguments) : error.what());
   }
   return perform(parsed, command, console);
 }

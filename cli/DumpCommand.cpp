@@ -38,7 +38,9 @@ int runDump(Context& context, const DumpArguments& arguments) {
 void addDumpCommand(CLI::App& app, Action& chosen) {
   auto arguments = std::make_shared<DumpArguments>();
   CLI::App* command = app.add_subcommand("dump", "Print the device library as JSON");
-  command->add_option("DEVICE", arguments->device, "The directory of the device")->required();
+  command->add_option("DEVICE", arguments->device, "The directory of the device")
+      ->required()
+      ->type_name("PATH");
   command->add_flag("--hash", arguments->hash, "Add the SHA-256 of every asset's file");
   command->footer(kExamples);
   command->callback([arguments, &chosen] {

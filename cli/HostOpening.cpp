@@ -78,12 +78,28 @@ void reportHostProblems(Context& context, const std::vector<HostProblem>& proble
   }
 }
 
+ErrorPtr withPath(const std::string& path, const ErrorPtr& error) {
+  return Error::make(error->domain(), error->code(), path + ": " + errorText(error));
+}
+
+std::unique_ptr<HostLibrary> openHost(const std::string& path, const HostOptions& options,
+                                      ErrorPtr* error) {
+  ErrorPtr failure;
+  auto library = openHostLibrary(path, options, &failure);
+  if (library) return library;
+  const bool usage = failure && failure->domain() == kHostErrorDomain &&
+                     failure->code() == static_cast<std::int64_t>(HostError::kUsage);
+  if (usage && !options.libraryID.empty()) {
+    throw UsageError(errorText(failure) + ": \"" + options.libraryID + "\"");
+  }
+  if (usage) throw UsageError(errorText(failure));
+  setError(error, withPath(path, failure));
+  return nullptr;
+}
+
 int exitCodeForHostError(const ErrorPtr& error, const CancelToken& cancel) {
   if (cancel.isCancelled()) return kSignalExitBase + cancel.signal();
-  if (isNoSpaceError(error)) return kExitNoSpace;
-  const bool usage = error && error->domain() == kHostErrorDomain &&
-                     error->code() == static_cast<std::int64_t>(HostError::kUsage);
-  return usage ? kExitUsage : kExitFailed;
+  return isNoSpaceError(error) ? kExitNoSpace : kExitFailed;
 }
 
 }  // namespace kx::cli

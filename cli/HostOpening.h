@@ -29,6 +29,12 @@ int timezoneMinutes(const std::string& text);
 // The options for opening a host, with progress on the terminal and cancelling.
 HostOptions hostOptions(Context& context, const FolderReading& reading, const CancelToken& cancel);
 
+// Opens the host. Null and an error that names the path; UsageError when an option makes no sense.
+std::unique_ptr<HostLibrary> openHost(const std::string& path, const HostOptions& options,
+                                      ErrorPtr* error);
+// The error with the path in front of its text.
+ErrorPtr withPath(const std::string& path, const ErrorPtr& error);
+
 // Names on standard error what was passed over or read without metadata.
 void reportHostProblems(Context& context, const std::vector<HostProblem>& problems);
 

@@ -122,7 +122,9 @@ int runShow(Context& context, const ShowArguments& arguments) {
 void addShowCommand(CLI::App& app, Action& chosen) {
   auto arguments = std::make_shared<ShowArguments>();
   CLI::App* command = app.add_subcommand("show", "Print a snapshot file in readable form");
-  command->add_option("FILE", arguments->file, "The snapshot file, a property list")->required();
+  command->add_option("FILE", arguments->file, "The snapshot file, a property list")
+      ->required()
+      ->type_name("PATH");
   command->add_flag("--summary", arguments->summary, "Print counts alone");
   command->footer(kExamples);
   command->callback([arguments, &chosen] {

@@ -49,11 +49,12 @@ int runSnapshot(Context& context, const SnapshotArguments& arguments) {
   const HostOptions options = hostOptions(context, arguments.reading, cancel);
   refuseNesting({"FOLDER", arguments.folder}, {"HOST", arguments.bundle});
   ErrorPtr error;
-  const auto library = openHostLibrary(arguments.folder, options, &error);
+  const auto library = openHost(arguments.folder, options, &error);
   if (!library) return reportFailure(context, error, exitCodeForHostError(error, cancel));
   std::vector<HostProblem> problems = library->problems();
   if (!writeHostBundle(*library, arguments.bundle, options, &problems, &error)) {
-    return reportFailure(context, error, exitCodeForHostError(error, cancel));
+    const int exitCode = exitCodeForHostError(error, cancel);
+    return reportFailure(context, withPath(arguments.bundle, error), exitCode);
   }
   return report(context, *library, arguments.bundle, problems);
 }
@@ -63,10 +64,13 @@ int runSnapshot(Context& context, const SnapshotArguments& arguments) {
 void addSnapshotCommand(CLI::App& app, Action& chosen) {
   auto arguments = std::make_shared<SnapshotArguments>();
   CLI::App* command = app.add_subcommand("snapshot", "Make a host bundle of a folder of photos");
-  command->add_option("FOLDER", arguments->folder, "The folder of photos and videos")->required();
+  command->add_option("FOLDER", arguments->folder, "The folder of photos and videos")
+      ->required()
+      ->type_name("PATH");
   command
       ->add_option("HOST", arguments->bundle, "The bundle to write; one that is there is replaced")
-      ->required();
+      ->required()
+      ->type_name("PATH");
   addFolderReadingOptions(*command, arguments->reading);
   command->footer(kExamples);
   command->callback([arguments, &chosen] {

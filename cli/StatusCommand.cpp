@@ -19,6 +19,7 @@ constexpr const char* kExamples =
 
 constexpr std::int32_t kSyncedAssetType = 256;
 constexpr std::size_t kNumberColumns = 9;
+constexpr const char* kFaceAlbums = "Face albums";
 constexpr std::size_t kWidestTitle = 48;
 
 struct Totals {
@@ -82,14 +83,19 @@ std::string shownTitle(const DeviceDump::Container& container) {
   return printable(container.title ? *container.title : "(no title)");
 }
 
-void printContainers(Console& console, const char* name,
-                     const std::vector<DeviceDump::Container>& containers) {
-  if (containers.empty()) return;
-  std::size_t columns = columnsOf(name);
-  for (const auto& container : containers) {
-    columns = std::max(columns, columnsOf(shownTitle(container)));
+std::size_t titleColumns(const DeviceDump& dump) {
+  std::size_t columns = columnsOf(kFaceAlbums);
+  for (const auto* list : {&dump.albums, &dump.events, &dump.faceAlbums}) {
+    for (const auto& container : *list) {
+      columns = std::max(columns, columnsOf(shownTitle(container)));
+    }
   }
-  columns = std::min(columns, kWidestTitle);
+  return std::min(columns, kWidestTitle);
+}
+
+void printContainers(Console& console, const char* name,
+                     const std::vector<DeviceDump::Container>& containers, std::size_t columns) {
+  if (containers.empty()) return;
   console.result("");
   console.heading(padded(name, columns) + rightAligned("Assets") + rightAligned("Pending"));
   for (const auto& container : containers) {
@@ -125,9 +131,10 @@ void printStatus(Console& console, const DeviceDump& dump, const std::optional<D
   console.result("Last sync  " + lastSyncText(dump, lastSync));
   console.result("Assets     " + assets);
   console.result("Pending    " + groupedNumber(dump.syncProgress.count));
-  printContainers(console, "Albums", dump.albums);
-  printContainers(console, "Events", dump.events);
-  printContainers(console, "Face albums", dump.faceAlbums);
+  const std::size_t columns = titleColumns(dump);
+  printContainers(console, "Albums", dump.albums, columns);
+  printContainers(console, "Events", dump.events, columns);
+  printContainers(console, kFaceAlbums, dump.faceAlbums, columns);
 }
 
 int runStatus(Context& context, const std::string& root) {
@@ -148,7 +155,9 @@ int runStatus(Context& context, const std::string& root) {
 void addStatusCommand(CLI::App& app, Action& chosen) {
   auto root = std::make_shared<std::string>();
   CLI::App* command = app.add_subcommand("status", "Say what is on the device and what is pending");
-  command->add_option("DEVICE", *root, "The directory of the device")->required();
+  command->add_option("DEVICE", *root, "The directory of the device")
+      ->required()
+      ->type_name("PATH");
   command->footer(kExamples);
   command->callback(
       [root, &chosen] { chosen = [root](Context& context) { return runStatus(context, *root); }; });

@@ -117,7 +117,7 @@ int runSync(Context& context, const SyncArguments& arguments) {
 
   const HostOptions options = hostOptions(context, arguments.reading, cancel);
   ErrorPtr error;
-  const auto library = openHostLibrary(arguments.host, options, &error);
+  const auto library = openHost(arguments.host, options, &error);
   if (!library) return report.end(hostFailure(error, cancel), {});
 
   LibraryLink link(*library);
@@ -140,9 +140,11 @@ void addSyncCommand(CLI::App& app, Action& chosen) {
   auto arguments = std::make_shared<SyncArguments>();
   CLI::App* command = app.add_subcommand("sync", "Bring a device in line with a host library");
   command->add_option("HOST", arguments->host, "A folder of photos and videos, or a host bundle")
-      ->required();
+      ->required()
+      ->type_name("PATH");
   command->add_option("DEVICE", arguments->device, "The directory of the device; made when missing")
-      ->required();
+      ->required()
+      ->type_name("PATH");
   command->add_flag("--allow-deletes", arguments->allowDeletes,
                     "Let this sync take away more than half of the synced photos");
   addFolderReadingOptions(*command, arguments->reading);

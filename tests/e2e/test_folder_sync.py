@@ -20,7 +20,7 @@ class FolderSync(EndToEnd):
         for number in range(1, 4):
             self.photo(f"Sea/{number}.jpg", f"2020:05:0{number} 10:00:00")
         for number in range(4, 7):
-            self.photo(f"Hills/{number}.jpg", "2020:05:01 12:00:00")
+            self.photo(f"Hills/{number}.jpg", f"2020:05:01 12:00:0{number}")
 
     def names_in(self, dump, title):
         return self.file_names(dump, self.titles(dump["albums"])[title])
@@ -63,7 +63,7 @@ class FolderSync(EndToEnd):
         os.rename(os.path.join(self.host, "Sea/2.jpg"), os.path.join(self.host, "Hills/2.jpg"))
         os.remove(os.path.join(self.host, "Hills/4.jpg"))
         self.photo("Sea/7.jpg", "2020:05:01 11:00:00")
-        self.photo("Hills/5.jpg", "2020:05:01 12:00:00", note=b" edited")
+        self.photo("Hills/5.jpg", "2020:05:01 12:00:05", note=b" edited")
         result = self.sync()
         self.assertEqual(result["outcome"], "synced")
         self.assertFalse(result["resync"])

@@ -143,7 +143,7 @@ class Refused(EndToEnd):
         face = {"faceAlbumUUID": uid("a"), "faceIndex": 0,
                 "faceRectangle": {"X": float("nan"), "Y": 0.1, "Width": 0.1, "Height": 0.1}}
         self.bundle(snapshot([asset(uid("kept"), faces=[face])]))
-        self.assert_refused("faceRectangle")
+        self.assert_refused('"X" is not finite')
 
     def test_root_that_is_no_dictionary(self):
         self.write(os.path.join(self.host, "PhotoLibrary.plist"),

@@ -53,9 +53,11 @@ class WrongUsage(EndToEnd):
         (["snapshot", "a"], "HOST"),
     )
 
-    def test_one_clear_line_a_hint_and_exit_code_2(self):
-        os.makedirs(self.path("a"))
+    def setUp(self):
+        super().setUp()
         self.write(self.path("a", "photo.jpg"), jpeg())
+
+    def test_one_clear_line_a_hint_and_exit_code_2(self):
         for arguments, word in self.TABLE:
             with self.subTest(arguments=arguments):
                 done = kxsync(*arguments, cwd=self.top)
@@ -163,11 +165,11 @@ class UnusableDevice(EndToEnd):
         self.assert_clear_failure(kxsync("sync", self.host, self.device), 1, self.device)
         self.assert_clear_failure(kxsync("status", self.device), 1, self.device)
 
-    def test_device_is_made_with_the_directories_above_it(self):
+    def test_device_below_a_directory_that_is_missing(self):
         self.bundle(snapshot([asset(uid(0))]))
-        self.device = self.path("new", "deeper", "device")
-        self.sync()
-        self.assertEqual(list(self.dump()["assets"]), [uid(0)])
+        self.device = self.path("new", "device")
+        self.assert_clear_failure(kxsync("sync", self.host, self.device), 1, self.device)
+        self.assertFalse(os.path.exists(self.path("new")))
 
 
 if __name__ == "__main__":
