@@ -40,7 +40,7 @@ FOREIGN = re.compile(
     r"|\bper sp" r"ec\b|\bOrder of buil" r"ding\b|\b[Ii]ss" r"ue #?[0-9]+\b|\.\./sha" r"red")
 DOCUMENT_TYPE = re.compile(rb"<!" rb"doctype", re.IGNORECASE)
 TEST = re.compile(r"^\s*(?:TEST|TEST_F|TEST_P|TYPED_TEST|TYPED_TEST_P|RC_GTEST_PROP|"
-                  r"RC_GTEST_FIXTURE_PROP)\s*\(", re.MULTILINE)
+                  r"RC_GTEST_FIXTURE_PROP|INSTANTIATE_(?:TYPED_)?TEST_SUITE_P)\s*\(", re.MULTILINE)
 
 
 def file_budget(path, text):
