@@ -1,6 +1,5 @@
 #include "testing/FaultySaver.h"
 
-#include <algorithm>
 #include <condition_variable>
 #include <utility>
 
@@ -13,6 +12,7 @@ struct FaultySaver::Shared {
   std::mutex mutex;
   std::map<const Data*, bool> finishedBlocks;  // of serialized jobs not handed over yet
   std::vector<Batch> batches;
+  bool mayHold = true;
   bool holding = false;
   std::vector<Held> held;
   std::size_t keepingBack = 0;  // batches with "cleanupNever" that are under way or kept
@@ -71,16 +71,23 @@ FaultySaver::Batch FaultySaver::observe(const std::vector<DataPtr>& jobs) {
 }
 
 void FaultySaver::saveSyncedAssets(std::vector<DataPtr> serializedJobs, Completion completion) {
+  Held batch{std::move(serializedJobs), std::move(completion)};
   {
     const std::lock_guard<std::mutex> lock(shared_->mutex);
-    shared_->batches.push_back(observe(serializedJobs));
-    if (!shared_->holding && script_.take("saverHold")) shared_->holding = true;
+    Batch observed = observe(batch.jobs);
+    for (const Job& job : observed) {
+      if (!job.fields.cleanupSyncState) continue;
+      batch.cleansUp = true;
+      batch.isAwaited = batch.isAwaited || job.hasFinishedBlock;
+    }
+    shared_->batches.push_back(std::move(observed));
+    if (!shared_->holding && shared_->mayHold && script_.take("saverHold")) shared_->holding = true;
     if (shared_->holding) {
-      shared_->held.push_back({std::move(serializedJobs), std::move(completion)});
+      shared_->held.push_back(std::move(batch));
       return;
     }
   }
-  handOver({std::move(serializedJobs), std::move(completion)});
+  handOver(std::move(batch));
 }
 
 void FaultySaver::handOver(Held batch) {
@@ -91,11 +98,7 @@ void FaultySaver::handOver(Held batch) {
         [completion = std::move(batch.completion), error] { completion(0, error); });
     return;
   }
-  const bool cleansUp = std::any_of(batch.jobs.begin(), batch.jobs.end(), [](const DataPtr& job) {
-    const auto fields = KXSyncSaveJob::fieldsFromSerializedData(job, nullptr);
-    return fields && fields->cleanupSyncState;
-  });
-  if (cleansUp) {
+  if (batch.cleansUp) {
     if (const auto fault = script_.take("cleanupError")) {
       const ErrorPtr error = fault->error ? fault->error : injectedError("cleanupError");
       if (onFailure_) onFailure_("cleanupError", error);
@@ -106,23 +109,27 @@ void FaultySaver::handOver(Held batch) {
           });
       return;
     }
-    if (script_.take("cleanupNever")) {
-      {
-        const std::lock_guard<std::mutex> lock(shared_->mutex);
-        ++shared_->keepingBack;
-      }
-      inner_.saveSyncedAssets(
-          std::move(batch.jobs), [shared = shared_, completion = std::move(batch.completion)](
-                                     std::size_t imported, const ErrorPtr& outcome) {
-            const std::lock_guard<std::mutex> lock(shared->mutex);
-            shared->keptBack.emplace_back(
-                [completion, imported, outcome] { completion(imported, outcome); });
-            shared->arrived.notify_all();
-          });
-      return;
-    }
+  }
+  if (batch.isAwaited && script_.take("cleanupNever")) {
+    keepBack(std::move(batch));
+    return;
   }
   inner_.saveSyncedAssets(std::move(batch.jobs), std::move(batch.completion));
+}
+
+void FaultySaver::keepBack(Held batch) {
+  {
+    const std::lock_guard<std::mutex> lock(shared_->mutex);
+    ++shared_->keepingBack;
+  }
+  inner_.saveSyncedAssets(std::move(batch.jobs),
+                          [shared = shared_, completion = std::move(batch.completion)](
+                              std::size_t imported, const ErrorPtr& outcome) {
+                            const std::lock_guard<std::mutex> lock(shared->mutex);
+                            shared->keptBack.emplace_back(
+                                [completion, imported, outcome] { completion(imported, outcome); });
+                            shared->arrived.notify_all();
+                          });
 }
 
 std::vector<FaultySaver::Batch> FaultySaver::takeBatches() {
@@ -142,7 +149,18 @@ void FaultySaver::release() {
     shared_->holding = false;
     held = std::exchange(shared_->held, {});
   }
-  for (Held& batch : held) handOver(std::move(batch));
+  for (Held& batch : held) {
+    batch.isAwaited = false;  // who waits for it waits already
+    handOver(std::move(batch));
+  }
+}
+
+void FaultySaver::setMayHold(bool mayHold) {
+  {
+    const std::lock_guard<std::mutex> lock(shared_->mutex);
+    shared_->mayHold = mayHold;
+  }
+  if (!mayHold) release();
 }
 
 bool FaultySaver::isKeepingBack() const {

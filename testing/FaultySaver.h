@@ -15,7 +15,8 @@ namespace kx {
 // steps fail by script: "serialize" (a job has no serialized form), "saver" (a batch ends with the
 // fault's error and nothing is imported), "saverHold" (from its first hit on, batches wait until
 // release), "cleanupError" (a batch with a clean-up job is worked, and ends with the fault's
-// error), "cleanupNever" (the completion of such a batch is kept back until deliverKeptBack).
+// error), "cleanupNever" (the completion of a batch with a clean-up job that somebody waits for is
+// kept back until deliverKeptBack).
 // Failures are told to `onFailure`. Any thread.
 class FaultySaver final : public KXAssetsSaver {
  public:
@@ -38,6 +39,8 @@ class FaultySaver final : public KXAssetsSaver {
   bool isHolding() const;
   // Hands over what was held, in order, and holds no more.
   void release();
+  // Whether "saverHold" may take hold from now on. Without, what was held is released.
+  void setMayHold(bool mayHold);
   // Whether a completion is being kept back; the waiting for it may as well end.
   bool isKeepingBack() const;
   void deliverKeptBack();
@@ -48,8 +51,11 @@ class FaultySaver final : public KXAssetsSaver {
   struct Held {
     std::vector<DataPtr> jobs;
     Completion completion;
+    bool cleansUp = false;   // holds a clean-up job
+    bool isAwaited = false;  // one with a finished block
   };
   void handOver(Held batch);
+  void keepBack(Held batch);
   Batch observe(const std::vector<DataPtr>& jobs);
 
   KXAssetsSaver& inner_;

@@ -128,10 +128,14 @@ void addClientCalls(DriveSession& session, DriveCallTable& table) {
       DriveLane::kPlugin, [&session](const DriveArguments&) {
         return DriveAnswer{plistJson(session.client().installedAssetMetrics()), nullptr};
       }};
-  table["client.new"] = {DriveLane::kConsole, [&session](const DriveArguments&) {
+  table["prepareForSync"].waitsForSaver = true;
+  table["assetTransferEnded"].waitsForSaver = true;
+  table["client.new"] = {DriveLane::kConsole,
+                         [&session](const DriveArguments&) {
                            session.renewClient();
                            return DriveAnswer();
-                         }};
+                         },
+                         true};
 }
 
 }  // namespace kx

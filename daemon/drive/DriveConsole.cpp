@@ -1,5 +1,6 @@
 #include "daemon/drive/DriveConsole.h"
 
+#include <algorithm>
 #include <cstdio>
 #include <iostream>
 #include <utility>
@@ -44,6 +45,7 @@ Json exceptionJson(const std::optional<RaisedException>& exception) {
 // A call that runs, or has run, beside the console.
 struct DriveConsole::Started {
   std::string name;
+  DriveLane lane = DriveLane::kConsole;
   Outcome outcome;
   DispatchSemaphore done{0};
 };
@@ -82,6 +84,7 @@ DriveConsole::Outcome DriveConsole::perform(const DriveCall& call, const Json& l
 void DriveConsole::start(const std::string& name, const DriveCall& call, Json line, Json* extra) {
   const auto started = std::make_shared<Started>();
   started->name = name;
+  started->lane = call.lane;
   started_[++lastStarted_] = started;
   DispatchQueue& queue = call.lane == DriveLane::kPlugin ? session_.plugin().queue() : *background_;
   queue.async([started, call, arguments = std::move(line)] {
@@ -99,7 +102,9 @@ DriveConsole::Outcome DriveConsole::wait(const DriveArguments& arguments, Json* 
   }
   const std::shared_ptr<Started> started = found->second;
   started_.erase(found);
+  session_.platform().saver().setMayHold(false);
   started->done.wait();
+  session_.platform().saver().setMayHold(true);
   (*extra)["call"] = started->name;
   return std::move(started->outcome);
 }
@@ -115,12 +120,23 @@ DriveConsole::Outcome DriveConsole::dispatch(const Json& line, const std::string
     start(name, call, line, extra);
     return {};
   }
-  if (call.lane == DriveLane::kConsole || arguments.boolean("onMainThread", false)) {
-    return perform(call, line);
-  }
+  // A call that waits for a held batch would wait for ever: no later line could release it.
+  const bool waits =
+      call.waitsForSaver || (call.lane == DriveLane::kPlugin && isStartedOnPluginQueue());
+  if (waits) session_.platform().saver().setMayHold(false);
   Outcome outcome;
-  session_.plugin().queue().sync([&] { outcome = perform(call, line); });
+  if (call.lane == DriveLane::kConsole || arguments.boolean("onMainThread", false)) {
+    outcome = perform(call, line);
+  } else {
+    session_.plugin().queue().sync([&] { outcome = perform(call, line); });
+  }
+  if (waits) session_.platform().saver().setMayHold(true);
   return outcome;
+}
+
+bool DriveConsole::isStartedOnPluginQueue() const {
+  return std::any_of(started_.begin(), started_.end(),
+                     [](const auto& entry) { return entry.second->lane == DriveLane::kPlugin; });
 }
 
 Json DriveConsole::answer(const std::string& text) {

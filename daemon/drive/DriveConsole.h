@@ -42,6 +42,7 @@ class DriveConsole {
   Outcome wait(const DriveArguments& arguments, nlohmann::ordered_json* extra);
   void start(const std::string& name, const DriveCall& call, nlohmann::ordered_json line,
              nlohmann::ordered_json* extra);
+  bool isStartedOnPluginQueue() const;
   static Outcome perform(const DriveCall& call, const nlohmann::ordered_json& line);
 
   DriveSession& session_;

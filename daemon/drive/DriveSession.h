@@ -32,6 +32,8 @@ enum class DriveLane {
 struct DriveCall {
   DriveLane lane = DriveLane::kConsole;
   std::function<DriveAnswer(const DriveArguments&)> run;
+  // Whether it waits for batches of the saver.
+  bool waitsForSaver = false;
 };
 using DriveCallTable = std::map<std::string, DriveCall, std::less<>>;
 
