@@ -52,6 +52,17 @@ bool InMemoryLibraryState::fails(std::string_view operation, ErrorPtr* error) co
   return true;
 }
 
+bool InMemoryLibraryState::isOrderedBefore(const AlbumRow& album, const AssetRow& a,
+                                           const AssetRow& b) const {
+  const auto keyOf = [&](const AssetRow& asset) {
+    std::optional<std::uint64_t> index;
+    if (album.uuid && asset.uuid && orderIndex) index = orderIndex(*album.uuid, *asset.uuid);
+    constexpr double kLast = std::numeric_limits<double>::infinity();
+    return std::tuple(!index, index.value_or(0), asset.sortToken.value_or(kLast), asset.uuid);
+  };
+  return keyOf(a) < keyOf(b);
+}
+
 InMemoryContext::InMemoryContext(std::shared_ptr<InMemoryLibraryState> state)
     : state_(std::move(state)) {}
 
@@ -336,17 +347,7 @@ void InMemoryContext::setAlbumMembers(std::int64_t row, std::vector<std::int64_t
 }
 
 bool InMemoryContext::isOrderedBefore(std::int64_t inAlbum, std::int64_t a, std::int64_t b) const {
-  const auto keyOf = [&](std::int64_t row) {
-    const AssetRow& data = asset(row);
-    const std::optional<std::string>& albumUUID = album(inAlbum).uuid;
-    std::optional<std::uint64_t> index;
-    if (albumUUID && data.uuid && state_->orderIndex) {
-      index = state_->orderIndex(*albumUUID, *data.uuid);
-    }
-    constexpr double kLast = std::numeric_limits<double>::infinity();
-    return std::tuple(!index, index.value_or(0), data.sortToken.value_or(kLast), data.uuid);
-  };
-  return keyOf(a) < keyOf(b);
+  return state_->isOrderedBefore(album(inAlbum), asset(a), asset(b));
 }
 
 }  // namespace kx

@@ -38,6 +38,9 @@ struct InMemoryLibraryState {
   std::size_t listSorts = 0;
 
   bool fails(std::string_view operation, ErrorPtr* error) const;
+  // The order inside an album: by index of the asset order file, then by sort token (null last),
+  // then by UUID.
+  bool isOrderedBefore(const AlbumRow& album, const AssetRow& a, const AssetRow& b) const;
 };
 
 // One view of the library: objects by identity, and changes that no transaction has saved, laid

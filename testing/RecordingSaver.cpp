@@ -1,5 +1,6 @@
 #include "testing/RecordingSaver.h"
 
+#include <algorithm>
 #include <cstdlib>
 
 #include "platform/foundation/PropertyList.h"
@@ -96,7 +97,7 @@ void RecordingSaver::process(const Batch& batch, const Completion& completion) {
     for (const KXSyncSaveJob::Fields& job : batch) {
       if (job.isSyncComplete) {
         seal(state.store, job.originalAssetPath.value_or(""));
-      } else if (!job.cleanupSyncState && import(state.store, job)) {
+      } else if (!job.cleanupSyncState && import(state, job)) {
         ++imported;
       }
     }
@@ -105,7 +106,8 @@ void RecordingSaver::process(const Batch& batch, const Completion& completion) {
 }
 
 // False for a job that would replace an asset of the device itself.
-bool RecordingSaver::import(InMemoryStore& store, const KXSyncSaveJob::Fields& job) {
+bool RecordingSaver::import(InMemoryLibraryState& state, const KXSyncSaveJob::Fields& job) {
+  InMemoryStore& store = state.store;
   const std::int64_t present = store.assetWithUUID(job.uuid.value_or(""));
   if (present != 0) {
     if (store.assets[present].savedAssetType != kKXSavedAssetTypeSynced) return false;
@@ -125,7 +127,11 @@ bool RecordingSaver::import(InMemoryStore& store, const KXSyncSaveJob::Fields& j
   for (const std::string& uri : job.albumURIs.value_or(std::vector<std::string>())) {
     const auto album = store.albums.find(rowOf(uri));
     if (album == store.albums.end()) continue;
-    album->second.assets.push_back(row);
+    std::vector<std::int64_t>& members = album->second.assets;
+    const auto place = std::find_if(members.begin(), members.end(), [&](std::int64_t other) {
+      return state.isOrderedBefore(album->second, store.assets[row], store.assets[other]);
+    });
+    members.insert(place, row);
     store.assets[row].albums.insert(album->first);
     reducePendingCount(store, album->first);
   }

@@ -41,7 +41,7 @@ class RecordingSaver final : public KXAssetsSaver {
 
  private:
   void process(const Batch& batch, const Completion& completion);
-  bool import(InMemoryStore& store, const KXSyncSaveJob::Fields& job);
+  bool import(InMemoryLibraryState& state, const KXSyncSaveJob::Fields& job);
   void seal(InMemoryStore& store, const std::string& snapshotPath);
 
   InMemoryPhotoLibraryFramework& library_;

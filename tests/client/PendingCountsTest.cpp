@@ -95,12 +95,12 @@ TEST_F(PendingCountsTest, AnEndingSyncPutsEverySyncedContainerToRest) {
   platform.library.perform([](InMemoryLibraryState& state) {
     state.store.albums[state.store.albumWithUUID("OWN")].pendingItemsCount = 9;
   });
-  setPending(OwnAlbum::kShoebox, 4, 3);
   EXPECT_TRUE(reconcile(SnapshotBuilder()
                             .asset(inEvent("A", "EV"))
                             .album("AL", "Trip", {"A"})
                             .album("FA", "Ann", {"A"}, SnapshotBuilder::kFaceAlbum)
                             .event("EV", "Day")));
+  setPending(OwnAlbum::kShoebox, 4, 3);
   client->_clearPendingCounts();
   client->libraryGroup()->wait();
   EXPECT_EQ(albums(), "Own(t1 n9)[] Trip[]");
