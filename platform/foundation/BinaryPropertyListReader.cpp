@@ -34,6 +34,24 @@ void BinaryPropertyListReader::fail(PropertyListError code, std::string what,
   throw PropertyListFailure(code, std::move(what), offset, path());
 }
 
+void BinaryPropertyListReader::failReference(std::uint64_t object,
+                                             const std::uint8_t* place) const {
+  fail(PropertyListError::kRef,
+       "reference to object " + std::to_string(object) + " of " + std::to_string(count_),
+       static_cast<std::uint64_t>(place - base_));
+}
+
+void BinaryPropertyListReader::failDepth(std::uint64_t offset) const {
+  fail(PropertyListError::kDepth,
+       "nested deeper than " + std::to_string(limits_.nestingDepth) + " levels", offset);
+}
+
+void BinaryPropertyListReader::failExpansion(std::uint64_t offset) const {
+  fail(PropertyListError::kExpansion,
+       "more than " + std::to_string(limits_.visits) + " values when shared ones are counted",
+       offset);
+}
+
 // The keys and indexes that lead from the root to the value at which the walk stands.
 std::string BinaryPropertyListReader::path() const {
   std::string result;
@@ -110,148 +128,6 @@ void BinaryPropertyListReader::readTrailer() {
   count_ = static_cast<std::uint32_t>(count);
   root_ = static_cast<std::uint32_t>(root);
   tableStart_ = static_cast<std::size_t>(table);
-}
-
-// At least the trailer follows each table entry, so that 8 bytes can always be loaded.
-std::uint64_t BinaryPropertyListReader::offsetOf(std::uint32_t object) const {
-  return PropertyListDocument::loadBig(base_ + tableStart_ + std::size_t{object} * offsetSize_,
-                                       offsetSize_);
-}
-
-std::uint32_t BinaryPropertyListReader::referenceAt(const std::uint8_t* place) const {
-  const std::uint64_t object = PropertyListDocument::loadBig(place, referenceSize_);
-  if (object >= count_) {
-    fail(PropertyListError::kRef,
-         "reference to object " + std::to_string(object) + " of " + std::to_string(count_),
-         static_cast<std::uint64_t>(place - base_));
-  }
-  return static_cast<std::uint32_t>(object);
-}
-
-void BinaryPropertyListReader::walk(std::uint32_t root) {
-  stack_.reserve(limits_.nestingDepth);
-  readObject(root);
-  if (nodes_[root].kind != Kind::kArray && nodes_[root].kind != Kind::kDictionary) return;
-  enter(root);
-  while (!stack_.empty()) {
-    Frame& frame = stack_.back();
-    if (frame.next == frame.count) {
-      leave();
-    } else {
-      advance(frame);
-    }
-  }
-}
-
-void BinaryPropertyListReader::enter(std::uint32_t object) {
-  DocumentNode& node = nodes_[object];
-  if (stack_.size() >= limits_.nestingDepth) {
-    fail(PropertyListError::kDepth,
-         "nested deeper than " + std::to_string(limits_.nestingDepth) + " levels",
-         offsetOf(object));
-  }
-  node.state = DocumentNode::kGrey;
-  const bool isDictionary = node.kind == Kind::kDictionary;
-  const std::size_t keyBytes = isDictionary ? std::size_t{node.high} * referenceSize_ : 0;
-  const std::uint64_t visits = 1 + (isDictionary ? std::uint64_t{node.high} : 0);
-  stack_.push_back(Frame{object, 0, node.high, static_cast<std::uint32_t>(visits),
-                         base_ + node.low + keyBytes, 0});
-  if (isDictionary) checkKeys(stack_.back());
-}
-
-void BinaryPropertyListReader::checkKeys(const Frame& frame) {
-  const DocumentNode& node = nodes_[frame.object];
-  const std::uint8_t* place = base_ + node.low;
-  for (std::uint32_t i = 0; i < node.high; ++i, place += referenceSize_) {
-    const std::uint32_t object = referenceAt(place);
-    DocumentNode& key = nodes_[object];
-    if (key.kind == Kind::kNull) readObject(object);
-    const auto offset = static_cast<std::uint64_t>(place - base_);
-    if (key.kind != Kind::kString) {
-      fail(PropertyListError::kKeyType, "a key is a " + std::string(kindName(key.kind)), offset);
-    }
-    if (key.extra == 0) {
-      const std::string_view text = document_->text(key);
-      if (text.size() > limits_.keyUnits && utf16Length(text) > limits_.keyUnits) {
-        fail(PropertyListError::kLimit,
-             "a key is longer than " + std::to_string(limits_.keyUnits) + " units", offset);
-      }
-      const std::uint32_t number = document_->internKey(object);
-      if (number == lastDictionaryOfKey_.size()) lastDictionaryOfKey_.push_back(0);
-    }
-    std::uint32_t& last = lastDictionaryOfKey_[key.extra - 1];
-    if (last == frame.object + 1) {
-      fail(PropertyListError::kDupKey,
-           "the key \"" + escapeControlCharacters(document_->text(key)) + "\" occurs twice",
-           offset);
-    }
-    last = frame.object + 1;
-  }
-  if (node.high > PropertyListDocument::kScanLimit) largeDictionaries_.push_back(frame.object);
-}
-
-// Goes over elements up to the next container that has to be entered, or to the end.
-void BinaryPropertyListReader::advance(Frame& frame) {
-  const std::uint8_t* place = frame.values + std::size_t{frame.next} * referenceSize_;
-  while (frame.next < frame.count) {
-    ++frame.next;
-    const std::uint32_t object = referenceAt(place);
-    DocumentNode& node = nodes_[object];
-    if (node.kind == Kind::kNull) readObject(object);
-    if (node.kind == Kind::kArray || node.kind == Kind::kDictionary) {
-      visitContainer(frame, object, place);
-      return;
-    }
-    ++frame.visits;
-    place += referenceSize_;
-  }
-}
-
-void BinaryPropertyListReader::visitContainer(Frame& frame, std::uint32_t object,
-                                              const std::uint8_t* place) {
-  const DocumentNode& node = nodes_[object];
-  if (node.state == DocumentNode::kWhite) {
-    enter(object);
-    return;
-  }
-  const auto offset = static_cast<std::uint64_t>(place - base_);
-  if (node.state == DocumentNode::kGrey) {
-    fail(PropertyListError::kCycle, "object " + std::to_string(object) + " holds itself", offset);
-  }
-  if (stack_.size() + node.height > limits_.nestingDepth) {
-    fail(PropertyListError::kDepth,
-         "nested deeper than " + std::to_string(limits_.nestingDepth) + " levels", offset);
-  }
-  frame.height = std::max(frame.height, node.height);
-  frame.visits += node.extra;
-  if (frame.visits > limits_.visits) {
-    fail(PropertyListError::kExpansion,
-         "more than " + std::to_string(limits_.visits) + " values when shared ones are counted",
-         offset);
-  }
-}
-
-void BinaryPropertyListReader::leave() {
-  const Frame frame = stack_.back();
-  if (frame.visits > limits_.visits) {
-    fail(PropertyListError::kExpansion,
-         "more than " + std::to_string(limits_.visits) + " values when shared ones are counted",
-         offsetOf(frame.object));
-  }
-  DocumentNode& node = nodes_[frame.object];
-  node.state = DocumentNode::kBlack;
-  node.height = static_cast<std::uint8_t>(frame.height + 1);
-  node.extra = frame.visits;
-  stack_.pop_back();
-  if (stack_.empty()) return;
-  Frame& parent = stack_.back();
-  parent.height = std::max(parent.height, node.height);
-  parent.visits += frame.visits;
-  if (parent.visits > limits_.visits) {
-    fail(PropertyListError::kExpansion,
-         "more than " + std::to_string(limits_.visits) + " values when shared ones are counted",
-         offsetOf(frame.object));
-  }
 }
 
 // Nothing reaches these objects, but the file is checked whole.

@@ -38,10 +38,17 @@ class BinaryPropertyListReader {
   };
 
   [[noreturn]] void fail(PropertyListError code, std::string what, std::uint64_t offset) const;
+  [[noreturn]] void failReference(std::uint64_t object, const std::uint8_t* place) const;
+  [[noreturn]] void failDepth(std::uint64_t offset) const;
+  [[noreturn]] void failExpansion(std::uint64_t offset) const;
   std::string path() const;
 
   void readTrailer();
-  std::uint64_t offsetOf(std::uint32_t object) const;
+  // At least the trailer follows each table entry, so that 8 bytes can always be loaded.
+  std::uint64_t offsetOf(std::uint32_t object) const {
+    return PropertyListDocument::loadBig(base_ + tableStart_ + std::size_t{object} * offsetSize_,
+                                         offsetSize_);
+  }
   // Reads the object's own bytes into its node.
   void readObject(std::uint32_t object);
   void readScalar(DocumentNode& node, std::size_t offset, unsigned marker);
@@ -58,7 +65,11 @@ class BinaryPropertyListReader {
   void claim(std::size_t offset, std::size_t end);
   void requireFixed(std::size_t offset, std::size_t size);
 
-  std::uint32_t referenceAt(const std::uint8_t* place) const;
+  std::uint32_t referenceAt(const std::uint8_t* place) const {
+    const std::uint64_t object = PropertyListDocument::loadBig(place, referenceSize_);
+    if (object >= count_) failReference(object, place);
+    return static_cast<std::uint32_t>(object);
+  }
   void walk(std::uint32_t root);
   void enter(std::uint32_t object);
   void checkKeys(const Frame& frame);
@@ -83,6 +94,9 @@ class BinaryPropertyListReader {
   std::vector<Frame> stack_;
   std::vector<std::uint32_t> lastDictionaryOfKey_;  // object plus 1, by key number
   std::vector<std::uint32_t> largeDictionaries_;
+  // By number of entries: the keys of the last small dictionary that were found good. Dictionaries
+  // of one kind list the same keys one after the other.
+  std::array<const std::uint8_t*, PropertyListDocument::kScanLimit + 1> goodKeys_{};
 };
 
 }  // namespace kx

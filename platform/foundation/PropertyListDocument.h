@@ -105,6 +105,8 @@ class PropertyListDocument final : public ValueStorage {
   // Position of a key in a dictionary, or kNone.
   std::size_t positionOf(std::uint32_t object, std::string_view key) const;
   static constexpr std::size_t kNone = static_cast<std::size_t>(-1);
+  // Dictionaries up to this size are scanned, larger ones get an index.
+  static constexpr std::size_t kScanLimit = 24;
 
   // Reads a big-endian integer of 1 to 8 bytes; 8 bytes from `from` on must be readable.
   static std::uint64_t loadBig(const std::uint8_t* from, unsigned size) {
@@ -117,7 +119,6 @@ class PropertyListDocument final : public ValueStorage {
   friend class BinaryPropertyListReader;
   friend class XmlPropertyListReader;
 
-  static constexpr std::size_t kScanLimit = 24;
   // Position plus 1 by key number, open addressing.
   struct LargeIndex {
     std::vector<std::uint32_t> slots;

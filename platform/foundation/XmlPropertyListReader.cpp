@@ -152,7 +152,7 @@ Value XmlPropertyListReader::readDocument() {
     }
   }
   scanner_.skipMisc(false);
-  if (!scanner_.atEnd()) scanner_.failSyntax("something follows the root", scanner_.offset());
+  scanner_.requireEnd();
   document_->indexLargeDictionaries(largeDictionaries_);
   return document_->valueAt(root_);
 }

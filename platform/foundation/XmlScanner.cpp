@@ -159,6 +159,12 @@ void XmlScanner::skipDocumentType() {
   failSyntax("a document type declaration does not end", start);
 }
 
+void XmlScanner::requireEnd() const {
+  if (atEnd()) return;
+  checkCharacter(at_);
+  failSyntax("something follows the root", at_);
+}
+
 // What stands here is neither a tag nor a comment.
 void XmlScanner::failMarkup() const {
   if (atEnd()) failSyntax("the file ends early", at_);

@@ -33,6 +33,8 @@ class XmlScanner {
 
   std::size_t offset() const { return at_; }
   bool atEnd() const { return at_ == text_.size(); }
+  // Anything that is still to come is an error.
+  void requireEnd() const;
 
   // The XML declaration, where there is one; `encodingOfBytes` is "UTF-8" or "UTF-16".
   void readDeclaration(std::string_view encodingOfBytes);
