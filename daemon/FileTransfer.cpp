@@ -178,6 +178,13 @@ FileDescriptor Staging::create(std::string* name) {
   }
 }
 
+// A disk filled to the last byte with staged files could not take in one of them.
+bool Staging::hasRoomFor(std::uint64_t bytes) const {
+  struct statvfs status {};
+  if (::fstatvfs(directory_.get(), &status) != 0) return true;  // the copy will tell
+  return static_cast<std::uint64_t>(status.f_bavail) * status.f_frsize >= bytes + kWorkingBytes;
+}
+
 Staging::Result Staging::take(const FileDescriptor& source, const OnBytes& onBytes) {
   Result result;
   struct stat before {};
@@ -186,6 +193,9 @@ Staging::Result Staging::take(const FileDescriptor& source, const OnBytes& onByt
     return result;
   }
   result.error = refusalOf(before);
+  if (!result.error && !hasRoomFor(static_cast<std::uint64_t>(before.st_size))) {
+    result.error = errorOf({ENOSPC, true, false});
+  }
   if (result.error) return result;
 
   std::string name;

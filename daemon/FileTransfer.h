@@ -13,6 +13,8 @@ namespace kx {
 
 // Largest media file that is moved.
 inline constexpr std::int64_t kMediaFileBytes = 64LL << 30;
+// What a copy leaves free on the device: room for the rows of the files that are staged already.
+inline constexpr std::uint64_t kWorkingBytes = 4ULL << 20;
 // Where arrived files wait for the asset daemon, relative to "/var/mobile/Media/".
 inline constexpr const char* kStagingPath = "Photos/Sync/Staging";
 
@@ -59,6 +61,7 @@ class Staging {
  private:
   Staging() = default;
   FileDescriptor create(std::string* name);
+  bool hasRoomFor(std::uint64_t bytes) const;
 
   FileDescriptor directory_;
   std::uint64_t counter_ = 0;

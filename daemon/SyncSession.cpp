@@ -12,6 +12,7 @@ namespace {
 // The plug-in only logs the type; 1 stands for a sync that the user asked for.
 constexpr std::uint32_t kSyncType = 1;
 constexpr const char* kAnchor = "1";
+constexpr const char* kNoSpaceText = "no space left on the device";
 
 ErrorPtr syncError(SyncErrorCode code, const std::string& message) {
   return Error::make(kSyncErrorDomain, static_cast<std::int64_t>(code),
@@ -296,7 +297,7 @@ void SyncSession::judge() {
   if (diskFull_ || importFull || isNoSpaceError(failure)) {
     result_.error = nullptr;
     fail(syncError(SyncErrorCode::kNoSpace,
-                   "no space left on the device: " + std::to_string(result_.imported) + " of " +
+                   std::string(kNoSpaceText) + ": " + std::to_string(result_.imported) + " of " +
                        std::to_string(result_.requested) + " files were brought"));
     return;
   }
@@ -330,6 +331,9 @@ void SyncSession::enter(SyncPhase phase) {
 void SyncSession::fail(const ErrorPtr& error) {
   if (result_.error) return;
   result_.error = error;
+  if (isNoSpaceError(error) && !error->message().starts_with(kNoSpaceText)) {
+    result_.error = prefixed(kNoSpaceText, *error);
+  }
   result_.outcome = SyncOutcome::kFailed;
   result_.exitCode = isNoSpaceError(error) ? kExitNoSpace : kExitFailed;
   if (error->domain() == kSyncErrorDomain &&

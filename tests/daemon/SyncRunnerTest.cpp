@@ -134,7 +134,9 @@ TEST_F(SyncRunnerTest, ReconcileWithoutRoomEndsWithCode6) {
   script.duringReconcile = [&] {
     device.noted.noteFailure("transaction", Error::make(kPosixErrorDomain, ENOSPC, "full"));
   };
-  EXPECT_EQ(run().exitCode, kExitNoSpace);
+  const SyncResult result = run();
+  EXPECT_EQ(result.exitCode, kExitNoSpace);
+  EXPECT_THAT(result.error->message(), testing::StartsWith("no space left on the device"));
 }
 
 TEST_F(SyncRunnerTest, AFailedTransactionClearsTheFlagThoughEverythingArrived) {
