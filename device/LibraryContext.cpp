@@ -109,7 +109,8 @@ std::vector<RowId> LibraryContext::insertedAlbums(ListId list, RowId after) cons
 bool LibraryContext::hasChanges() const {
   const auto changed = [](const auto& entry) { return entry.second->hasChanges(); };
   return !memberships_.empty() || !changedFaces_.empty() ||
-         std::any_of(changedAlbums_.begin(), changedAlbums_.end(), changed) ||
+         std::any_of(changedAlbums_.begin(), changedAlbums_.end(),
+                     [&](const auto& e) { return changed(e) || e.second->sortWanted_; }) ||
          std::any_of(changedAssets_.begin(), changedAssets_.end(), changed) ||
          std::any_of(std::begin(lists_), std::end(lists_),
                      [](const auto& list) { return list->hasChanges(); });

@@ -73,8 +73,7 @@ ObjectID StoredAlbum::objectID() const {
 bool StoredAlbum::isDeleted() const { return life_ != Life::kLive; }
 
 bool StoredAlbum::hasChanges() const {
-  return life_ == Life::kDeleting || insertedInto_.has_value() || sortWanted_ ||
-         (edits_ && !edits_->empty());
+  return life_ == Life::kDeleting || insertedInto_.has_value() || (edits_ && !edits_->empty());
 }
 
 void StoredAlbum::deleteObject() {

@@ -82,6 +82,7 @@ class StoredAlbum : public KXManagedAlbum, public std::enable_shared_from_this<S
   std::unique_ptr<Edits> edits_;
   mutable Life life_ = Life::kLive;
   std::optional<ListId> insertedInto_;  // set until it is saved
+  // To be put in order with the next save, which writes only where the order is wrong.
   bool sortWanted_ = false;
 };
 
