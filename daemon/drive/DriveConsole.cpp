@@ -78,6 +78,8 @@ DriveConsole::Outcome DriveConsole::perform(const DriveCall& call, const Json& l
     }
   });
   if (own) outcome.exception = own;
+  // Whoever waited for what was kept back has given up by now.
+  if (call.lane == DriveLane::kPlugin) session_.platform().saver().deliverKeptBack();
   return outcome;
 }
 
@@ -87,7 +89,7 @@ void DriveConsole::start(const std::string& name, const DriveCall& call, Json li
   started->lane = call.lane;
   started_[++lastStarted_] = started;
   DispatchQueue& queue = call.lane == DriveLane::kPlugin ? session_.plugin().queue() : *background_;
-  queue.async([started, call, arguments = std::move(line)] {
+  queue.async([this, started, call, arguments = std::move(line)] {
     started->outcome = perform(call, arguments);
     started->done.signal();
   });
@@ -140,7 +142,6 @@ bool DriveConsole::isStartedOnPluginQueue() const {
 }
 
 Json DriveConsole::answer(const std::string& text) {
-  session_.platform().saver().deliverKeptBack();
   Json answer{{"call", nullptr}};
   Outcome outcome;
   try {

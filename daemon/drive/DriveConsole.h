@@ -43,7 +43,7 @@ class DriveConsole {
   void start(const std::string& name, const DriveCall& call, nlohmann::ordered_json line,
              nlohmann::ordered_json* extra);
   bool isStartedOnPluginQueue() const;
-  static Outcome perform(const DriveCall& call, const nlohmann::ordered_json& line);
+  Outcome perform(const DriveCall& call, const nlohmann::ordered_json& line);
 
   DriveSession& session_;
   DriveCallTable table_;
