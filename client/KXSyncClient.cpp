@@ -230,7 +230,7 @@ void KXSyncClient::submitWatched(BlockFailure& failure, const Block& submit) {
   try {
     submit();
   } catch (...) {
-    failure.note(std::current_exception());
+    failure.noteOfSubmitter(std::current_exception());
   }
   blockFailure_ = nullptr;
 }

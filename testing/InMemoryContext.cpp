@@ -58,7 +58,8 @@ bool InMemoryLibraryState::isOrderedBefore(const AlbumRow& album, const AssetRow
     std::optional<std::uint64_t> index;
     if (album.uuid && asset.uuid && orderIndex) index = orderIndex(*album.uuid, *asset.uuid);
     constexpr double kLast = std::numeric_limits<double>::infinity();
-    return std::tuple(!index, index.value_or(0), asset.sortToken.value_or(kLast), asset.uuid);
+    return std::tuple(!index, index.value_or(0), asset.sortToken.value_or(kLast),
+                      asset.uuid ? std::string_view(*asset.uuid) : std::string_view());
   };
   return keyOf(a) < keyOf(b);
 }
@@ -333,6 +334,18 @@ std::vector<std::int64_t> InMemoryContext::albumRows() const {
   }
   std::erase_if(rows, [this](std::int64_t row) { return isDeleted(row); });
   return {rows.begin(), rows.end()};
+}
+
+std::int64_t InMemoryContext::albumWithUUID(std::string_view uuid) const {
+  for (const auto& entry : state_->store.albums) {
+    const bool isChanged = changes_.albums.contains(entry.first);
+    const AlbumRow& row = isChanged ? album(entry.first) : entry.second;
+    if (row.uuid == uuid && !isDeleted(entry.first)) return entry.first;
+  }
+  for (const std::int64_t row : changes_.inserted) {
+    if (!isDeleted(row) && changes_.albums.contains(row) && album(row).uuid == uuid) return row;
+  }
+  return 0;
 }
 
 std::vector<std::int64_t> InMemoryContext::albumMembers(std::int64_t row) const {

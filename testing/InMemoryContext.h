@@ -103,6 +103,7 @@ class InMemoryContext final : public KXManagedObjectContext {
   std::vector<std::int64_t> list(SeedList which) const;
   void setList(SeedList which, std::vector<std::int64_t> rows);
   std::vector<std::int64_t> albumRows() const;
+  std::int64_t albumWithUUID(std::string_view uuid) const;  // 0 when absent
   std::vector<std::int64_t> albumMembers(std::int64_t row) const;
   void setAlbumMembers(std::int64_t row, std::vector<std::int64_t> members);
   // The order inside an album.

@@ -116,10 +116,8 @@ class InMemoryPhotoLibraryFramework::Library final : public KXPhotoLibrary {
     return albums;
   }
   KXGenericAlbumPtr albumWithUUID(std::string_view uuid) override {
-    for (const std::int64_t row : context().albumRows()) {
-      if (context().album(row).uuid == uuid) return context().albumObject(row);
-    }
-    return nullptr;
+    const std::int64_t row = context().albumWithUUID(uuid);
+    return row == 0 ? nullptr : context().albumObject(row);
   }
   KXManagedAssetPtr assetWithUUID(std::string_view uuid) override {
     const std::int64_t row = context().isDeleted(shared_->state->store.assetWithUUID(uuid))

@@ -128,9 +128,10 @@ bool RecordingSaver::import(InMemoryLibraryState& state, const KXSyncSaveJob::Fi
     const auto album = store.albums.find(rowOf(uri));
     if (album == store.albums.end()) continue;
     std::vector<std::int64_t>& members = album->second.assets;
-    const auto place = std::find_if(members.begin(), members.end(), [&](std::int64_t other) {
-      return state.isOrderedBefore(album->second, store.assets[row], store.assets[other]);
-    });
+    const auto place = std::upper_bound(
+        members.begin(), members.end(), row, [&](std::int64_t added, std::int64_t other) {
+          return state.isOrderedBefore(album->second, store.assets[added], store.assets[other]);
+        });
     members.insert(place, row);
     store.assets[row].albums.insert(album->first);
     reducePendingCount(store, album->first);
