@@ -82,6 +82,8 @@ function(kx_test folder)
   target_link_libraries(${target} PRIVATE kx_options kx_test_support ${arg_LIBRARIES} kx_testing
                         rapidcheck
                         GTest::gmock_main GTest::gmock GTest::gtest)
+  # Compiling the tests costs more than running them: they are not worth optimising.
+  target_compile_options(${target} PRIVATE $<$<CONFIG:Debug>:-O0>)
   target_compile_definitions(${target} PRIVATE
     KX_TEST_SOURCE_DIR="${PROJECT_SOURCE_DIR}"
     KX_TEST_BIN_DIR="${CMAKE_RUNTIME_OUTPUT_DIRECTORY}"
