@@ -6,6 +6,7 @@
 #include <atomic>
 #include <exception>
 #include <optional>
+#include <system_error>
 #include <thread>
 #include <tuple>
 #include <unordered_map>
@@ -39,9 +40,15 @@ class Reader {
   bool run() {
     const unsigned helpers = std::clamp(options_.threads, 1U, kMaxThreads) - 1;
     std::vector<std::thread> threads;
-    for (unsigned i = 0; i < helpers; ++i) threads.emplace_back([this] { work(nullptr); });
+    try {
+      for (unsigned i = 0; i < helpers; ++i) threads.emplace_back([this] { work(nullptr); });
+    } catch (const std::system_error&) {
+      // No more threads to be had: those that are there do the work.
+    }
     work(&options_.progress);
     for (std::thread& thread : threads) thread.join();
+    // The other threads may have read the last files, or all of them.
+    if (!stop_ && options_.progress) report(options_.progress);
     if (failure_) std::rethrow_exception(failure_);
     return !cancelled_;
   }
