@@ -29,6 +29,8 @@ constexpr const char* kExamples =
     "by\n"
     "a signal (the same command goes on from there).";
 
+constexpr std::size_t kFailuresShown = 10;
+
 struct SyncArguments {
   std::string host;
   std::string device;
@@ -51,9 +53,7 @@ class SyncReport {
   int end(const SyncResult& result, const std::vector<HostProblem>& problems) {
     if (ended_.exchange(true)) return result.exitCode;
     reportHostProblems(context_, problems);
-    for (const SyncFailure& failure : result.failed) {
-      context_.console.warning("not synced: " + failure.uuid + ": " + failure.reason);
-    }
+    nameFailures(result);
     if (context_.options.json) {
       nlohmann::ordered_json json = syncResultJson(result);
       json["hostProblems"] = hostProblemsJson(problems);
@@ -78,6 +78,21 @@ class SyncReport {
   }
 
  private:
+  // All of them when they are what went wrong; a run that ended early left most of its files.
+  void nameFailures(const SyncResult& result) {
+    std::size_t left = result.failed.size();
+    std::size_t shown = result.outcome == SyncOutcome::kPartial ? left : kFailuresShown;
+    for (const SyncFailure& failure : result.failed) {
+      if (shown-- == 0) break;
+      context_.console.warning("not synced: " + failure.uuid + ": " + failure.reason);
+      --left;
+    }
+    if (left > 0) {
+      context_.console.warning("... and " + groupedNumber(left) +
+                               " more that were not synced (--json lists all)");
+    }
+  }
+
   void summarize(const SyncResult& result) {
     if (result.outcome == SyncOutcome::kNull || changedNothing(result)) {
       context_.console.result("Nothing to do: the device is in line with the host.");

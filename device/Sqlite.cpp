@@ -1,5 +1,8 @@
 #include "device/Sqlite.h"
 
+#include <sys/statvfs.h>
+
+#include <cerrno>
 #include <cmath>
 #include <limits>
 
@@ -13,12 +16,29 @@ constexpr int kCommitAttempts = 12;
 
 int primary(int code) { return code & 0xff; }
 
+// Whether the file system that holds the database has no byte or no file left.
+bool isFull(sqlite3* connection) {
+  const char* path = sqlite3_db_filename(connection, "main");
+  struct statvfs status = {};
+  if (path == nullptr || ::statvfs(path, &status) != 0) return false;
+  return status.f_bavail == 0 || (status.f_files > 0 && status.f_favail == 0);
+}
+
+// Where SQLite cannot make or extend a file for want of room, its code does not always say so: for
+// a journal it tries again read-only, and the system's error is then that of the second attempt.
+int withFullDisk(int code, sqlite3* connection) {
+  if (primary(code) != SQLITE_CANTOPEN && primary(code) != SQLITE_IOERR) return code;
+  const int system = sqlite3_system_errno(connection);
+  return system == ENOSPC || system == EDQUOT || isFull(connection) ? SQLITE_FULL : code;
+}
+
 }  // namespace
 
 ErrorPtr SqliteError::asError() const {
   switch (primary(code_)) {
     case SQLITE_FULL:
-      return deviceError(DeviceError::kNoSpace, what());
+      return deviceError(DeviceError::kNoSpace,
+                         "no space left on the device: " + std::string(what()));
     case SQLITE_CORRUPT:
     case SQLITE_NOTADB:
       return deviceError(DeviceError::kDamaged, what());
@@ -38,7 +58,8 @@ SqliteDatabase::SqliteDatabase(const std::string& path, Access access) {
   if (access == Access::kCreate) flags |= SQLITE_OPEN_CREATE;
   const int code = sqlite3_open_v2(path.c_str(), &connection_, flags, nullptr);
   if (code != SQLITE_OK) {
-    const SqliteError error(code, "cannot open the library: " + std::string(sqlite3_errstr(code)));
+    const SqliteError error(withFullDisk(code, connection_),
+                            "cannot open the library: " + std::string(sqlite3_errstr(code)));
     sqlite3_close(connection_);
     throw error;
   }
@@ -54,7 +75,8 @@ SqliteDatabase::~SqliteDatabase() {
 }
 
 void SqliteDatabase::fail(int code, std::string_view doing) const {
-  throw SqliteError(code, std::string(doing) + ": " + sqlite3_errmsg(connection_));
+  throw SqliteError(withFullDisk(code, connection_),
+                    std::string(doing) + ": " + sqlite3_errmsg(connection_));
 }
 
 void SqliteDatabase::execute(const char* sql) {

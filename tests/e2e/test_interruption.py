@@ -104,33 +104,46 @@ class FullDisk(EndToEnd):
 
     SCRIPT = """
 set -e
-mount -t tmpfs -o size=$1 none "$2"
+mount -t tmpfs -o "$1" none "$2"
 shift
 set +e
 "$0" sync "$2" "$1" --json; first=$?
-mount -o remount,size=400m "$1"
+mount -o remount,size=400m,nr_inodes=100000 "$1"
 "$0" sync "$2" "$1" --json; second=$?
 "$0" dump "$1" --json
 exit $((first * 10 + second))
 """
 
-    def test_full_disk_says_so_and_goes_on_once_there_is_room(self):
+    def sync_with_little_room(self, options, count):
+        """A sync on a file system made with those options, and one more once there is room."""
+        done = subprocess.run(["unshare", "-rm", "sh", "-c", self.SCRIPT, KXSYNC, options,
+                               self.device, self.host], capture_output=True, text=True,
+                              env=environment(), check=False)
+        self.assertEqual(done.returncode, 60, done.stdout[:2000] + done.stderr[:2000])
+        first, second, dump = map(json.loads, done.stdout.splitlines())
+        self.assertIn(first["outcome"], ("failed", "partial", "stopped"))
+        self.assertRegex(first["error"]["message"], "[Nn]o space")
+        self.assertEqual(second["outcome"], "synced")
+        self.assertEqual(second["requested"], count - first["imported"], "nothing is moved twice")
+        self.assertEqual(len(dump["assets"]), count)
+        return first
+
+    def test_too_few_bytes(self):
         count = 40
-        items = [asset(uid(number)) for number in range(count)]
-        media = {uid(number): jpeg() + bytes([number]) * 1_000_000 for number in range(count)}
-        self.bundle(snapshot(items), media=media)
+        media = {uid(number): jpeg() + bytes(1_000_000) for number in range(count)}
+        self.bundle(snapshot([asset(uid(number)) for number in range(count)]), media=media)
         os.makedirs(self.device)
-        for size in ("1m", "70m", "90m"):
+        for size in ("40k", "120k", "300k", "1m", "8m", "30m", "64m", "70m", "85m", "95m"):
             with self.subTest(size=size):
-                done = subprocess.run(
-                    ["unshare", "-rm", "sh", "-c", self.SCRIPT, KXSYNC, size, self.device,
-                     self.host], capture_output=True, text=True, env=environment(), check=False)
-                self.assertEqual(done.returncode, 60, done.stdout[:2000] + done.stderr)
-                first, second, dump = map(json.loads, done.stdout.splitlines())
-                self.assertIn(first["outcome"], ("failed", "partial", "stopped"))
-                self.assertRegex(first["error"]["message"], "space|full|room")
-                self.assertEqual(second["outcome"], "synced")
-                self.assertEqual(len(dump["assets"]), count)
+                self.sync_with_little_room("size=" + size, count)
+
+    def test_disk_that_turns_out_full_while_files_are_copied(self):
+        count = 1000
+        self.bundle(snapshot([asset(uid(number)) for number in range(count)]))
+        os.makedirs(self.device)
+        for files in (8, 12, 16, 20, 24, 28, 40, 100, 300, 900):
+            with self.subTest(files=files):
+                self.sync_with_little_room(f"size=400m,nr_inodes={files}", count)
 
 
 if __name__ == "__main__":
