@@ -1,0 +1,132 @@
+#include "tests/device/DeviceFixture.h"
+
+namespace kx {
+namespace {
+
+// The last-synced snapshot is written on proof alone.
+class SealTest : public DeviceTest {
+ protected:
+  bool sealed() const { return exists(device_paths::kLastSynced); }
+  // Why the last seal job was left undone, as the library's log has it.
+  std::string reason() const {
+    std::string text;
+    for (const CapturedMessage& message : logs_.libraryMessages()) {
+      if (message.text.starts_with("the sync is not sealed")) text = message.text;
+    }
+    return text;
+  }
+};
+
+TEST_F(SealTest, WritesACopyWhenEveryAssetIsThere) {
+  putSnapshot({kUUID1, kUUID2});
+  const Result result = save({importJob(kUUID1, kJpeg), importJob(kUUID2, kJpeg), sealJob()});
+  EXPECT_EQ(result.first, 2U);
+  EXPECT_EQ(result.second, nullptr);
+  ASSERT_TRUE(sealed()) << reason();
+  EXPECT_TRUE(exists(device_paths::kSnapshot));
+  EXPECT_EQ(content(device_paths::kLastSynced), content(device_paths::kSnapshot));
+  EXPECT_TRUE(dump().lastSynced);
+}
+
+TEST_F(SealTest, LeavesAnEqualCopyAlone) {
+  putSnapshot({});
+  save({sealJob()});
+  ASSERT_TRUE(sealed());
+  const auto written = std::filesystem::last_write_time(at(device_paths::kLastSynced));
+  device().takeCounters();
+  save({sealJob()});
+  EXPECT_EQ(std::filesystem::last_write_time(at(device_paths::kLastSynced)), written);
+  EXPECT_EQ(device().takeCounters().rowsWritten, 0U);
+}
+
+TEST_F(SealTest, IsWithheldForAMissingAsset) {
+  putSnapshot({kUUID1, kUUID2});
+  save({importJob(kUUID1, kJpeg), sealJob()});
+  EXPECT_FALSE(sealed());
+  EXPECT_NE(reason().find(kUUID2 + " is not in the library"), std::string::npos) << reason();
+}
+
+TEST_F(SealTest, IsWithheldForAnotherModificationDate) {
+  putSnapshot({kUUID1}, 100.5);
+  save({importJob(kUUID1, kJpeg), sealJob()});
+  EXPECT_FALSE(sealed());
+  EXPECT_NE(reason().find("another modification date"), std::string::npos) << reason();
+}
+
+TEST_F(SealTest, IsWithheldForAnIncompleteAsset) {
+  putSnapshot({kUUID1});
+  save({importJob(kUUID1, kJpeg)});
+  transaction([&] {
+    DeviceAssetFields fields;
+    fields.incomplete = true;
+    EXPECT_TRUE(device().admin().setAssetFields(library(), kUUID1, fields));
+  });
+  save({sealJob()});
+  EXPECT_FALSE(sealed());
+  EXPECT_NE(reason().find("is incomplete"), std::string::npos) << reason();
+}
+
+TEST_F(SealTest, IsWithheldForAnAssetOfTheDevicesOwn) {
+  putSnapshot({kUUID1});
+  NewDeviceAsset own;
+  own.uuid = kUUID1;
+  own.path = "/var/mobile/Media/DCIM/1";
+  own.modificationDate = Date{100.0};
+  ASSERT_TRUE(device().admin().addAsset(own, nullptr));
+  save({sealJob()});
+  EXPECT_FALSE(sealed());
+}
+
+TEST_F(SealTest, IsWithheldWhenSomethingHasFailed) {
+  putSnapshot({kUUID1});
+  save({importJob(kUUID1, kJpeg), importJob("EMPTY", ""), sealJob()});
+  EXPECT_FALSE(sealed());
+  EXPECT_NE(reason().find("something failed"), std::string::npos) << reason();
+  device().health().reset();
+  save({sealJob()});
+  EXPECT_TRUE(sealed());
+}
+
+TEST_F(SealTest, IsWithheldAfterATransactionThatFailed) {
+  putSnapshot({});
+  transaction([] { throw std::runtime_error("no"); });
+  save({sealJob()});
+  EXPECT_FALSE(sealed());
+  EXPECT_TRUE(device().health().anyFailure());
+}
+
+TEST_F(SealTest, IsWithheldWithoutASnapshotThatMakesSense) {
+  save({sealJob()});
+  EXPECT_FALSE(sealed());
+  EXPECT_NE(reason().find("cannot read"), std::string::npos) << reason();
+  putFile(device_paths::kSnapshot, "no property list");
+  save({sealJob()});
+  EXPECT_FALSE(sealed());
+}
+
+TEST_F(SealTest, GoesWhenASyncedFileIsLost) {
+  putSnapshot({kUUID1, kUUID2});
+  save({importJob(kUUID1, kJpeg), importJob(kUUID2, kJpeg), sealJob()});
+  ASSERT_TRUE(sealed());
+  reopen();
+  EXPECT_TRUE(sealed());
+  const std::string lost = dump().assets.at(0).path;
+  close();
+  std::filesystem::remove(at(lost));
+  open();
+  EXPECT_FALSE(sealed());
+  ASSERT_EQ(dump().assets.size(), 1U);
+  EXPECT_EQ(dump().assets[0].uuid, kUUID2);
+}
+
+TEST_F(SealTest, GoesWithTheDatabase) {
+  putSnapshot({});
+  save({sealJob()});
+  close();
+  std::filesystem::remove(at(device_paths::kDatabase));
+  open();
+  EXPECT_FALSE(sealed());
+}
+
+}  // namespace
+}  // namespace kx
