@@ -77,7 +77,7 @@ SyncResult SyncSession::run() {
   return std::move(result_);
 }
 
-bool SyncSession::checkBeforeFirstEffect() {
+ErrorPtr SyncSession::checkAgainstDevice() {
   DeviceComparison comparison;
   ErrorPtr error = compareWithDevice(snapshot_.checked, context_.device.platform(), &comparison);
   if (!error) error = refuseDeviceMadeContainers(comparison);
@@ -85,6 +85,21 @@ bool SyncSession::checkBeforeFirstEffect() {
     error = guardAgainstDeletes(snapshot_.checked, comparison);
   }
   if (!error) error = refuseWithoutSpace(comparison, context_.host, context_.options);
+  return error;
+}
+
+// Whether the host's snapshot is, byte for byte, the one that the device sealed last.
+bool SyncSession::matchesSeal() {
+  if (!files_.fileExists(kLastSyncedPath)) return false;
+  ErrorPtr ignored;
+  const DataPtr last = files_.readFile(kLastSyncedPath, &ignored);
+  return last && last->isEqualToData(*snapshot_.bytes);
+}
+
+bool SyncSession::checkBeforeFirstEffect() {
+  // These very bytes have been synced whole: everything unlisted is gone since, and everything
+  // listed is there.
+  ErrorPtr error = matchesSeal() ? nullptr : checkAgainstDevice();
   std::shared_ptr<PluginModule> module = context_.options.plugin;
   if (!error && !module) module = PluginModule::load(context_.options.pluginPath, &error);
   if (!error) {
@@ -180,11 +195,8 @@ void SyncSession::settleLibrarySwitch(bool reconciled) {
 
 // By the rules of the reconcile, over the same files, before it changes them.
 bool SyncSession::predictResync() {
-  ErrorPtr ignored;
-  const DataPtr last =
-      files_.fileExists(kLastSyncedPath) ? files_.readFile(kLastSyncedPath, &ignored) : nullptr;
-  if (last && last->isEqualToData(*snapshot_.bytes)) return false;
-  Value known = last ? readDevicePropertyList(files_, kLastSyncedPath)["libraryUUID"] : Value();
+  if (matchesSeal()) return false;
+  Value known = readDevicePropertyList(files_, kLastSyncedPath)["libraryUUID"];
   if (!known.isString()) {
     known = readDevicePropertyList(files_, kCurrentLibraryPath)["libraryUUID"];
   }

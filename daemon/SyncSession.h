@@ -54,6 +54,8 @@ class SyncSession {
   void collectChanges();
   void judge();
   bool predictResync();
+  bool matchesSeal();
+  ErrorPtr checkAgainstDevice();
   void enter(SyncPhase phase);
   // Ends the run: notes the first error and the exit code that goes with it.
   void fail(const ErrorPtr& error);

@@ -389,6 +389,18 @@ INSTANTIATE_TEST_SUITE_P(Counts, GuardTest,
                                   std::to_string(row.param.listed);
                          });
 
+TEST_F(SyncRunnerTest, TheSealedSnapshotItselfIsNotComparedAgain) {
+  seedAssets(60);
+  device.memory.memoryFiles.writeFileAtomically(kLastSyncedPath, link.snapshotBytes->span(),
+                                                nullptr);
+  const std::size_t opened = device.memory.library.openedLibraries();
+  EXPECT_EQ(run().exitCode, kExitDone);
+  EXPECT_EQ(device.memory.library.openedLibraries(), opened);
+  // One byte more makes it another snapshot, with all the checks.
+  link.snapshotBytes = plistBytes(snapshotRoot({assetItem("A"), assetItem("C")}));
+  EXPECT_EQ(run().exitCode, kExitGuard);
+}
+
 TEST_F(SyncRunnerTest, TheGuardCountsSyncedAssetsAlone) {
   for (int i = 0; i < 100; ++i) {
     AssetSeed seed;
