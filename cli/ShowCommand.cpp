@@ -10,6 +10,7 @@
 #include "cli/Command.h"
 #include "cli/JsonOutput.h"
 #include "cli/SnapshotText.h"
+#include "daemon/SnapshotJson.h"
 #include "daemon/SyncRunner.h"
 #include "platform/foundation/Limits.h"
 #include "platform/foundation/PropertyList.h"

@@ -5,7 +5,6 @@
 #include <unordered_map>
 
 #include "cli/Progress.h"
-#include "daemon/PlistJson.h"
 #include "records/TesselDates.h"
 
 namespace kx::cli {
@@ -113,8 +112,6 @@ std::string describeAsset(const KXSAsset& asset) {
   return line;
 }
 
-nlohmann::ordered_json itemJson(const KXSItem& item) { return plistJson(item.propertyList()); }
-
 nlohmann::ordered_json textJson(OptionalString text) {
   return text ? nlohmann::ordered_json(*text) : nlohmann::ordered_json(nullptr);
 }
@@ -162,30 +159,6 @@ nlohmann::ordered_json countsJson(const KXSLibraryChangeSnapshot& snapshot) {
                     {"albums", counts.albums},         {"events", counts.events},
                     {"faceAlbums", counts.faceAlbums}, {"masterAlbums", counts.masterAlbums},
                     {"deletes", counts.deletes}};
-  return json;
-}
-
-nlohmann::ordered_json snapshotJson(const KXSLibraryChangeSnapshot& snapshot) {
-  nlohmann::ordered_json json;
-  json["libraryUUID"] = textJson(snapshot.libraryUUID());
-  json["libraryKind"] = textJson(snapshot.libraryKind());
-  json["isFolderSync"] = snapshot.isFolderSync();
-  nlohmann::ordered_json ordered = nlohmann::ordered_json::array();
-  for (const KXSItemPtr& item : *snapshot.orderedAlbums()) ordered.push_back(itemJson(*item));
-  json["orderedAlbums"] = std::move(ordered);
-  // Inserted at the end without a look-up of the key, which a map knows to be new.
-  nlohmann::ordered_json::object_t assets;
-  for (const auto& entry : *snapshot.assetsByUUID()) {
-    assets.std::vector<nlohmann::ordered_json::object_t::value_type>::emplace_back(
-        std::string(entry.key.stringValue()), itemJson(*entry.value));
-  }
-  json["assets"] = std::move(assets);
-  nlohmann::ordered_json::object_t deletes;
-  for (const auto& entry : *snapshot.deletes()) {
-    deletes.std::vector<nlohmann::ordered_json::object_t::value_type>::emplace_back(
-        std::string(entry.key.stringValue()), itemJson(*entry.value));
-  }
-  json["deletes"] = std::move(deletes);
   return json;
 }
 

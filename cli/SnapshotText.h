@@ -17,8 +17,6 @@ struct SnapshotCounts {
 // These raise TypeError when a field holds another type than it should.
 SnapshotCounts countSnapshot(const KXSLibraryChangeSnapshot& snapshot);
 nlohmann::ordered_json countsJson(const KXSLibraryChangeSnapshot& snapshot);
-// All of it: "libraryUUID", "libraryKind", "isFolderSync", "orderedAlbums", "assets", "deletes".
-nlohmann::ordered_json snapshotJson(const KXSLibraryChangeSnapshot& snapshot);
 
 // For people: what library it is, the counts and, unless `summary`, every container and asset.
 // `lines` receives the text line by line.
