@@ -103,10 +103,12 @@ void ProgressDisplay::show(const SyncProgress& state) {
   if (!console_.errIsTerminal()) return;
   const double now = clock_.absoluteTime();
   const bool newPhase = !started_ || state.phase != lastPhase_;
-  if (!newPhase && now - lastDrawnSeconds_ < kRedrawSeconds) return;
-  if (newPhase) startSeconds_ = now;
+  const bool newTotal = state.filesTotal != lastTotal_;
+  if (!newPhase && !newTotal && now - lastDrawnSeconds_ < kRedrawSeconds) return;
+  if (newPhase || newTotal) startSeconds_ = now;
   started_ = true;
   lastPhase_ = state.phase;
+  lastTotal_ = state.filesTotal;
   lastDrawnSeconds_ = now;
   console_.progress(progressLine(state, now - startSeconds_));
 }

@@ -19,7 +19,8 @@ std::string readableDuration(double seconds);
 // the line names what is being done.
 std::string progressLine(const SyncProgress& state, double seconds);
 
-// Draws progress lines on the console, at most ten a second. One thread; the clock outlives it.
+// Draws progress lines on the console: whenever something new begins, else at most ten a second.
+// One thread; the clock outlives it.
 class ProgressDisplay {
  public:
   ProgressDisplay(Console& console, Clock& clock) : console_(console), clock_(clock) {}
@@ -33,6 +34,7 @@ class ProgressDisplay {
   double startSeconds_ = 0.0;
   double lastDrawnSeconds_ = 0.0;
   SyncPhase lastPhase_ = SyncPhase::kChecking;
+  std::size_t lastTotal_ = 0;
 };
 
 }  // namespace kx::cli

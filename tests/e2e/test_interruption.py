@@ -12,7 +12,7 @@ import unittest
 from harness import (EndToEnd, KXSYNC, album, asset, environment, finish, jpeg, kxsync, snapshot,
                      start, uid)
 
-MANY = 3000
+MANY = 1500
 WAIT_SECONDS = 120
 
 
@@ -25,15 +25,15 @@ class Running(EndToEnd):
         self.bundle(root)
 
     def start_and_reach_transfers(self):
-        """A running sync that has imported something, and is far from its end."""
+        """A running sync that has begun to copy files and is far from its end."""
         process = start("sync", self.host, self.device, "--json")
         self.addCleanup(process.stderr.close)
         self.addCleanup(process.stdout.close)
         self.addCleanup(process.kill)
-        synced = os.path.join(self.device, "var/mobile/Media/PhotoData/SyncedAssets")
+        staging = os.path.join(self.device, "var/mobile/Media/Photos/Sync/Staging")
         until = time.monotonic() + WAIT_SECONDS
-        while not any(files for _, _, files in os.walk(synced)):
-            self.assertIsNone(process.poll(), "it ended before anything was imported")
+        while not os.path.isdir(staging) or not os.listdir(staging):
+            self.assertIsNone(process.poll(), "it ended before anything was copied")
             self.assertLess(time.monotonic(), until)
         return process
 
@@ -67,6 +67,7 @@ class Running(EndToEnd):
     def test_second_run_names_the_holder_and_reading_goes_on(self):
         self.many()
         process = self.start_and_reach_transfers()
+        process.send_signal(signal.SIGSTOP)
         done = kxsync("sync", self.host, self.device)
         reading = kxsync("status", self.device), kxsync("dump", self.device)
         self.assertIsNone(process.poll(), "the first run still holds the device")
@@ -74,6 +75,7 @@ class Running(EndToEnd):
         for reader in reading:
             self.assertEqual((reader.code, reader.err), (0, ""))
         result = json.loads(kxsync("sync", self.host, self.device, "--json").out)
+        process.send_signal(signal.SIGCONT)
         self.assertEqual(result["outcome"], "failed")
         self.assertIn(str(process.pid), result["error"]["message"])
         self.assertEqual(finish(process).code, 0)
