@@ -64,6 +64,25 @@ function(_kx_has_concurrency out files)
   endforeach()
 endfunction()
 
+# Starting a sanitized program is slow: one entry of ctest for all tests of a folder, and one for its
+# concurrency tests.
+function(_kx_sanitized_test folder tests all_concurrent concurrent)
+  _kx_concurrency_patterns(patterns "${tests}")
+  if(all_concurrent)
+    set(patterns "*")
+    set(concurrent TRUE)
+  else()
+    add_test(NAME ${folder} COMMAND test_${folder} --gtest_brief=1 "--gtest_filter=-${patterns}")
+    set_tests_properties(${folder} PROPERTIES TIMEOUT 1500 LABELS ${folder})
+  endif()
+  if(concurrent)
+    add_test(NAME ${folder}.concurrency
+             COMMAND test_${folder} --gtest_brief=1 "--gtest_filter=${patterns}")
+    set_tests_properties(${folder}.concurrency PROPERTIES TIMEOUT 900
+                         LABELS "${folder};concurrency")
+  endif()
+endfunction()
+
 # kx_test(FOLDER [CONCURRENCY] [PROGRAMS] [LIBRARIES target...])
 # tests/FOLDER/*.cpp -> executable test_FOLDER, each of its tests an entry of ctest with the label
 # FOLDER, and "concurrency" where _kx_concurrency_patterns says so or, with CONCURRENCY, on all.
@@ -99,6 +118,10 @@ function(kx_test folder)
   _kx_has_concurrency(concurrent "${tests}")
   if(arg_CONCURRENCY OR concurrent)
     set_property(GLOBAL APPEND PROPERTY KX_CONCURRENCY_TARGETS ${target})
+  endif()
+  if(KX_SANITIZE)
+    _kx_sanitized_test(${folder} "${tests}" "${arg_CONCURRENCY}" "${concurrent}")
+    return()
   endif()
   if(arg_CONCURRENCY)
     gtest_discover_tests(${target} ${common} TEST_LIST ${target}_CONCURRENCY

@@ -12,7 +12,7 @@ namespace {
 class MalformedBinary : public testing::TestWithParam<BadInput> {};
 
 TEST_P(MalformedBinary, IsRefused) {
-  const Reading reading = readBytes(GetParam().bytes);
+  const Reading reading = readBytes(GetParam().bytes());
   EXPECT_EQ(reading.codeName(), propertyListErrorName(GetParam().code)) << reading.text();
   EXPECT_TRUE(reading.value.isNull());
   ASSERT_NE(reading.error, nullptr);
@@ -259,7 +259,7 @@ Rows depthRows() {
   rows.push_back({"Arrays65", nestedBytes(65), code, 8 + 64 * 5});
   rows.push_back({"Arrays66", nestedBytes(66), code, 8 + 64 * 5});
   rows.push_back({"Arrays5000", nestedBytes(5000), code, 8 + 64 * 5});
-  rows.push_back({"Arrays500000", nestedBytes(500'000), code, 8 + 64 * 5});
+  rows.push_back({"Arrays500000", [] { return nestedBytes(500'000); }, code, 8 + 64 * 5});
   rows.push_back({"Dictionaries65", nested(65, true).bytes(), code, 8 + 64 * 9});
   // A tower of 60 that was already walked stands again below 5 more.
   BinaryFile shared;

@@ -2,11 +2,13 @@
 
 #include <cstdint>
 #include <cstdlib>
+#include <functional>
 #include <iterator>
 #include <map>
 #include <memory>
 #include <optional>
 #include <string>
+#include <type_traits>
 #include <utility>
 #include <vector>
 
@@ -135,9 +137,24 @@ inline std::size_t xmlBodyOffset() { return xml("").size() - std::string("</plis
 inline const std::string kDocumentType = std::string("<!DOC") + "TYPE";
 
 // One malformed input: what a reader must say about it, and where when that is determined.
+// Text that is made when it is asked for: every process of the suite registers all rows, and large
+// inputs would make each of them slow.
+class LazyText {
+ public:
+  LazyText(std::string text)  // NOLINT: a text is one that is ready
+      : make_([ready = std::move(text)] { return ready; }) {}
+  LazyText(const char* text) : LazyText(std::string(text)) {}  // NOLINT
+  template <typename Make, typename = std::enable_if_t<std::is_invocable_r_v<std::string, Make>>>
+  LazyText(Make make) : make_(std::move(make)) {}  // NOLINT
+  std::string operator()() const { return make_(); }
+
+ private:
+  std::function<std::string()> make_;
+};
+
 struct BadInput {
   std::string name;
-  std::string bytes;
+  LazyText bytes;
   PropertyListError code;
   std::optional<std::uint64_t> offset;
 };
