@@ -238,7 +238,8 @@ RC_GTEST_PROP(ContainerIndexTest, AgreesWithAWalk, ()) {
   for (const auto& entry : containers) {
     bool qualifies = false;
     if (const auto* album = dynamic_cast<const KXSAlbum*>(entry.value.get())) {
-      for (const Value& uuid : *album->assetUUIDs()) {
+      const std::optional<ArrayView> uuids = album->assetUUIDs();
+      for (const Value& uuid : *uuids) {
         qualifies = qualifies || uuid.stringValue() == asset;
       }
     } else {
