@@ -15,6 +15,8 @@ namespace {
 using Json = nlohmann::ordered_json;
 
 constexpr std::size_t kLongestLineBytes = 64U << 20;
+// Answers of asynchronous calls are kept until they are collected: no more than these.
+constexpr std::size_t kMostStarted = 256;
 
 // Reads a line without its end; false at the end of the input. `tooLong` lines are read to their
 // end and given up.
@@ -84,6 +86,9 @@ DriveConsole::Outcome DriveConsole::perform(const DriveCall& call, const Json& l
 }
 
 void DriveConsole::start(const std::string& name, const DriveCall& call, Json line, Json* extra) {
+  if (started_.size() >= kMostStarted) {
+    throw DriveException("TooManyStarted", "wait for a call that was started before");
+  }
   const auto started = std::make_shared<Started>();
   started->name = name;
   started->lane = call.lane;

@@ -112,6 +112,15 @@ class ClientCalls(ConsoleTest):
         self.assertEqual(self.console.raw("wait", of=1)["exception"]["name"], "BadArgument")
 
 
+    def test_answers_that_nobody_collects_are_bounded(self):
+        for _ in range(256):
+            self.console.raw("currentSyncAnchor", **{"async": True})
+        answer = self.console.raw("currentSyncAnchor", **{"async": True})
+        self.assertEqual(answer["exception"]["name"], "TooManyStarted")
+        self.assertEqual(self.console.raw("wait", of=1)["result"], "1")
+        self.assertIn("started", self.console.raw("currentSyncAnchor", **{"async": True}))
+
+
 class MemoryPressure(ConsoleTest):
     def test_one_source_however_often_the_transfers_are_listed(self):
         self.assertEqual(self.call("device.memoryPressure")["sources"], 0)
