@@ -23,6 +23,18 @@ class CheckLayers(PlantedTree):
         self.plant("client/A.cpp", '// first\n#include "device/Library.h"\n')
         self.assert_red("client/A.cpp:2:", "client may not include device")
 
+    def test_backup_stands_between_device_and_daemon(self):
+        self.plant("backup/Reader.h", '#include "device/Library.h"\n#include <nlohmann/json.hpp>\n')
+        self.plant("daemon/A.cpp", '#include "backup/Reader.h"\n')
+        self.plant("cli/A.cpp", '#include "backup/Reader.h"\n')
+        self.assert_green()
+        self.plant("device/B.cpp", '#include "backup/Reader.h"\n')
+        self.assert_red("device/B.cpp:1:", "device may not include backup")
+        self.plant("device/B.cpp", "")
+        self.plant("daemon/Host.h", "")
+        self.plant("backup/B.cpp", '#include "daemon/Host.h"\n')
+        self.assert_red("backup/B.cpp:1:", "backup may not include daemon")
+
     def test_foundation_may_not_include_dispatch(self):
         self.plant("platform/dispatch/Queue.h", "")
         self.plant("platform/foundation/A.cpp", '#include "platform/dispatch/Queue.h"\n')
