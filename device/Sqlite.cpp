@@ -101,37 +101,24 @@ void SqliteDatabase::rollback() {
   if (sqlite3_get_autocommit(connection_) == 0) execute("ROLLBACK");
 }
 
-void SqliteDatabase::copyTo(SqliteDatabase& target) {
+void SqliteDatabase::copyTo(SqliteDatabase& target, const std::function<bool()>& goOn) {
   constexpr std::string_view kDoing = "the library cannot be copied";
+  constexpr int kPagesPerStep = 1024;
   sqlite3_backup* const copy = sqlite3_backup_init(target.connection_, "main", connection_, "main");
   if (copy == nullptr) target.fail(sqlite3_extended_errcode(target.connection_), kDoing);
-  int code = SQLITE_BUSY;
-  for (int attempt = 1; attempt <= kCommitAttempts && primary(code) == SQLITE_BUSY; ++attempt) {
-    code = sqlite3_backup_step(copy, -1);
+  int code = SQLITE_OK;
+  int refusals = 0;
+  while (code == SQLITE_OK || (primary(code) == SQLITE_BUSY && refusals < kCommitAttempts)) {
+    if (goOn && !goOn()) {
+      sqlite3_backup_finish(copy);
+      throw SqliteError(SQLITE_INTERRUPT, std::string(kDoing) + ": interrupted");
+    }
+    code = sqlite3_backup_step(copy, kPagesPerStep);
+    if (primary(code) == SQLITE_BUSY) ++refusals;  // after the connection's busy time
   }
   const int ended = sqlite3_backup_finish(copy);
   if (code == SQLITE_DONE && ended == SQLITE_OK) return;
   target.fail(ended != SQLITE_OK ? ended : code, kDoing);
-}
-
-void SqliteDatabase::copyTo(SqliteDatabase& target, const std::function<bool()>& goOn) {
-  constexpr int kPagesPerStep = 1024;
-  sqlite3_backup* copy = sqlite3_backup_init(target.connection_, "main", connection_, "main");
-  if (copy == nullptr)
-    target.fail(sqlite3_errcode(target.connection_), "the library is not copied");
-  int code = SQLITE_OK;
-  int refusals = 0;
-  while (code == SQLITE_OK || (primary(code) == SQLITE_BUSY && refusals < kCommitAttempts)) {
-    if (!goOn()) {
-      sqlite3_backup_finish(copy);
-      throw SqliteError(SQLITE_INTERRUPT, "the library is not copied: interrupted");
-    }
-    code = sqlite3_backup_step(copy, kPagesPerStep);
-    if (primary(code) == SQLITE_BUSY) ++refusals;  // after the busy time of this connection
-  }
-  const int finished = sqlite3_backup_finish(copy);
-  if (code != SQLITE_DONE)
-    target.fail(finished != SQLITE_OK ? finished : code, "the library is not copied");
 }
 
 std::uint64_t SqliteDatabase::rowsWritten() const {

@@ -47,12 +47,10 @@ class SqliteDatabase {
   // Commits, again and again for a minute while readers of other processes are in the way.
   void commit();
   void rollback();
-  // Puts all of this database in the place of all that is in the target, as one transaction of the
-  // target: SQLite's online backup. Good while others read either of them.
-  void copyTo(SqliteDatabase& target);
-  // SQLite's online backup: copies this database whole, as of one moment, over `target`, which is
-  // empty. Asked between steps, `goOn` ends it with SQLITE_INTERRUPT when it says no.
-  void copyTo(SqliteDatabase& target, const std::function<bool()>& goOn);
+  // Puts all of this database, as of one moment, in the place of all that is in the target, as one
+  // transaction of the target: SQLite's online backup. Good while others read either of them. Asked
+  // between steps, `goOn` ends it (SQLITE_INTERRUPT) by saying no.
+  void copyTo(SqliteDatabase& target, const std::function<bool()>& goOn = {});
   std::uint64_t statementsRun() const { return statementsRun_; }
   std::uint64_t rowsWritten() const;
 
