@@ -216,8 +216,7 @@ BackupAlbum readAlbum(const Json& json, std::size_t* members) {
   album.uuid = text(json, "uuid");
   album.title = optionalText(json, "title");
   album.kind = static_cast<std::int32_t>(whole(json, "kind", INT32_MIN, INT32_MAX));
-  if (std::find(std::begin(kSyncedKinds), std::end(kSyncedKinds), album.kind) !=
-      std::end(kSyncedKinds)) {
+  if (isSyncedAlbumKind(album.kind)) {
     throw Refusal("an album of kind " + std::to_string(album.kind) + " is not the device's own");
   }
   const std::string name = text(json, "list");
@@ -270,6 +269,11 @@ struct timespec BackupFileTime::unixTime() const {
   return {static_cast<time_t>(seconds + kUnixOfReferenceDate), nanoseconds};
 }
 
+bool isSyncedAlbumKind(std::int32_t kind) {
+  return std::find(std::begin(kSyncedKinds), std::end(kSyncedKinds), kind) !=
+         std::end(kSyncedKinds);
+}
+
 const BackupFile* BackupManifest::find(std::string_view path) const {
   const auto found = std::lower_bound(
       files.begin(), files.end(), path,
@@ -311,7 +315,8 @@ std::string serializeAlbums(const std::vector<BackupAlbum>& albums) {
                        {"members", album.members}});
   }
   const Json json = {{"format", kAlbumsFormat}, {"version", kVersion}, {"albums", entries}};
-  return json.dump() + "\n";
+  // A title that is no UTF-8 is for people alone and may lose its bad bytes.
+  return json.dump(-1, ' ', false, Json::error_handler_t::replace) + "\n";
 }
 
 std::optional<BackupManifest> parseManifest(std::string_view bytes, ErrorPtr* error) {

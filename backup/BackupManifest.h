@@ -53,6 +53,9 @@ struct BackupManifest {
   friend bool operator==(const BackupManifest&, const BackupManifest&) = default;
 };
 
+// Whether albums of that kind come from the host, so that a backup leaves them out.
+bool isSyncedAlbumKind(std::int32_t kind);
+
 enum class BackupAlbumList { kAlbums, kEvents, kFaceAlbums };
 
 // An album that the device itself made, as albums.json says.
