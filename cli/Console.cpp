@@ -64,6 +64,7 @@ Console::Setup Console::processSetup() {
   setup.out = &std::cout;
   setup.err = &std::cerr;
   setup.errIsTerminal = ::isatty(STDERR_FILENO) == 1;
+  setup.outIsTerminal = ::isatty(STDOUT_FILENO) == 1;
   const bool colors = colorsWanted();
   setup.colorOut = colors && ::isatty(STDOUT_FILENO) == 1;
   setup.colorErr = colors && setup.errIsTerminal;

@@ -19,6 +19,7 @@ class Console {
     bool colorOut = false;
     bool colorErr = false;
     int errColumns = 80;
+    bool outIsTerminal = false;
   };
   // The process's own streams, as they are: terminals or not, NO_COLOR and TERM obeyed.
   static Setup processSetup();
@@ -27,6 +28,7 @@ class Console {
 
   void withoutColor();
   bool errIsTerminal() const { return setup_.errIsTerminal; }
+  bool outIsTerminal() const { return setup_.outIsTerminal; }
 
   // One line of a result for people. A heading is bold where that is possible.
   void result(std::string_view line);
