@@ -93,7 +93,8 @@ std::int64_t copyBytes(int from, int to, std::int64_t size) {
           ::copy_file_range(from, nullptr, to, nullptr, static_cast<std::size_t>(size - done), 0);
       if (copied > 0) done += copied;
       if (copied < 0 && errno != EINTR) {
-        if (errno == ENOSPC || errno == EDQUOT || errno == EIO) throw WriteFailure{errno, "a file"};
+        // Of an EIO it is not known which side it is on; the copy through memory tells.
+        if (errno == ENOSPC || errno == EDQUOT) throw WriteFailure{errno, "a file"};
         inKernel = false;
       }
       if (copied != 0) continue;

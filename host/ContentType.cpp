@@ -137,6 +137,46 @@ bool isOldQuickTime(const Head& head) {
   return head.at(4, "moov") || head.at(4, "mdat") || head.at(4, "wide") || head.at(4, "pnot");
 }
 
+struct NamedKind {
+  std::string_view extension;
+  bool isVideo = false;
+};
+
+constexpr std::array kNamedKinds{
+    NamedKind{"jpg"sv},        NamedKind{"jpeg"sv},       NamedKind{"jpe"sv},
+    NamedKind{"jfif"sv},       NamedKind{"mpo"sv},        NamedKind{"png"sv},
+    NamedKind{"gif"sv},        NamedKind{"tif"sv},        NamedKind{"tiff"sv},
+    NamedKind{"webp"sv},       NamedKind{"heic"sv},       NamedKind{"heif"sv},
+    NamedKind{"hif"sv},        NamedKind{"avif"sv},       NamedKind{"bmp"sv},
+    NamedKind{"jp2"sv},        NamedKind{"jxl"sv},        NamedKind{"dng"sv},
+    NamedKind{"nef"sv},        NamedKind{"cr2"sv},        NamedKind{"cr3"sv},
+    NamedKind{"arw"sv},        NamedKind{"orf"sv},        NamedKind{"rw2"sv},
+    NamedKind{"raf"sv},        NamedKind{"pef"sv},        NamedKind{"srw"sv},
+    NamedKind{"mp4"sv, true},  NamedKind{"mov"sv, true},  NamedKind{"m4v"sv, true},
+    NamedKind{"3gp"sv, true},  NamedKind{"3g2"sv, true},  NamedKind{"avi"sv, true},
+    NamedKind{"mkv"sv, true},  NamedKind{"webm"sv, true}, NamedKind{"mpg"sv, true},
+    NamedKind{"mpeg"sv, true}, NamedKind{"mts"sv, true},  NamedKind{"m2ts"sv, true},
+    NamedKind{"wmv"sv, true},  NamedKind{"asf"sv, true}};
+
+const NamedKind* kindOfExtension(std::string_view extension) {
+  const auto found =
+      std::find_if(kNamedKinds.begin(), kNamedKinds.end(),
+                   [extension](const NamedKind& kind) { return kind.extension == extension; });
+  return found == kNamedKinds.end() ? nullptr : &*found;
+}
+
+// In small letters, without dot; "" when the last component has none.
+std::string extensionOf(std::string_view path) {
+  const std::string_view name = path.substr(path.rfind('/') + 1);
+  const std::size_t dot = name.rfind('.');
+  if (dot == std::string_view::npos) return {};
+  std::string extension(name.substr(dot + 1));
+  for (char& letter : extension) {
+    if (letter >= 'A' && letter <= 'Z') letter = static_cast<char>(letter - 'A' + 'a');
+  }
+  return extension;
+}
+
 ContentType streamTypeOf(const Head& head) {
   if (head.at(0, "\0\0\x01\xBA"sv) || head.at(0, "\0\0\x01\xB3"sv))
     return {"video/mpeg", "mpg", true, Container::kNone};
@@ -170,18 +210,17 @@ ContentType contentTypeOf(std::span<const std::uint8_t> firstBytes) {
 }
 
 bool hasMediaExtension(std::string_view name) {
-  static constexpr std::array kExtensions{
-      "jpg"sv,  "jpeg"sv, "png"sv, "gif"sv,  "tif"sv, "tiff"sv, "webp"sv, "heic"sv,
-      "heif"sv, "avif"sv, "bmp"sv, "jp2"sv,  "jxl"sv, "dng"sv,  "nef"sv,  "cr2"sv,
-      "cr3"sv,  "arw"sv,  "orf"sv, "rw2"sv,  "raf"sv, "mp4"sv,  "mov"sv,  "m4v"sv,
-      "3gp"sv,  "avi"sv,  "mkv"sv, "webm"sv, "mpg"sv, "mpeg"sv, "mts"sv,  "wmv"sv};
-  const std::size_t dot = name.rfind('.');
-  if (dot == std::string_view::npos) return false;
-  std::string extension(name.substr(dot + 1));
-  for (char& letter : extension) {
-    if (letter >= 'A' && letter <= 'Z') letter = static_cast<char>(letter - 'A' + 'a');
-  }
-  return std::find(kExtensions.begin(), kExtensions.end(), extension) != kExtensions.end();
+  const std::string extension = extensionOf(name);
+  return !extension.empty() && kindOfExtension(extension) != nullptr;
+}
+
+ContentType contentTypeOfName(std::string_view path) {
+  constexpr std::string_view kUnknownBytes = "application/octet-stream";
+  const std::string extension = extensionOf(path);
+  if (extension.empty()) return {kUnknownBytes, "bin", false, Container::kNone};
+  const NamedKind* kind = kindOfExtension(extension);
+  if (kind == nullptr) return {};
+  return {kUnknownBytes, kind->extension, kind->isVideo, Container::kNone};
 }
 
 }  // namespace kx

@@ -39,4 +39,8 @@ ContentType contentTypeOf(std::span<const std::uint8_t> firstBytes);
 // Whether the name looks like a photo or video: then it is worth a word that the content is none.
 bool hasMediaExtension(std::string_view name);
 
+// What a file that cannot be read may be, by its name: a photo or video of unknown content when it
+// is named like one, or has no extension at all; else no media.
+ContentType contentTypeOfName(std::string_view path);
+
 }  // namespace kx

@@ -4,8 +4,10 @@
 
 #include <algorithm>
 #include <atomic>
+#include <cerrno>
 #include <exception>
 #include <optional>
+#include <span>
 #include <system_error>
 #include <thread>
 #include <tuple>
@@ -87,12 +89,18 @@ class Reader {
     struct stat status = {};
     const int error = openRegularBeneath(folder_, file.path, &handle, &status);
     if (error != 0) {
-      reading.problems.push_back("it cannot be read: " + systemErrorText(error));
+      const std::string text = "it cannot be read: " + systemErrorText(error);
+      if (isNoLongerThere(error)) {
+        reading.problems.push_back(text);
+      } else {
+        keepUnread(file, contentTypeOfName(file.path), text, &reading);
+      }
       return reading;
     }
+    ContentType type = contentTypeOfName(file.path);
     try {
       const ByteSource source(handle.get(), static_cast<std::uint64_t>(status.st_size));
-      const ContentType type = contentTypeOf(source.head(kContentTypeBytes));
+      type = contentTypeOf(source.head(kContentTypeBytes));
       if (!type.isMedia()) {
         if (hasMediaExtension(file.path))
           reading.problems.emplace_back("its content is no photo or video");
@@ -105,9 +113,36 @@ class Reader {
                               asset.metadata.problems.end());
       reading.asset = std::move(asset);
     } catch (const ReadError& failure) {
-      reading.problems.push_back(std::string("it ") + failure.what());
+      reading.problems.clear();
+      keepUnread(file, type, std::string("it ") + failure.what(), &reading);
     }
     return reading;
+  }
+
+  // Gone, or replaced by what is no regular file, since it was listed.
+  static bool isNoLongerThere(int error) {
+    return error == ENOENT || error == ENOTDIR || error == ELOOP || error == EINVAL;
+  }
+
+  // A file whose bytes cannot be had just now stays in the library, or its copies would be deleted
+  // on every device: with its name, size and time of change, which the listing knows, and what its
+  // side file says.
+  void keepUnread(const ScannedFile& file, const ContentType& type, const std::string& problem,
+                  Reading* reading) const {
+    if (!type.isMedia()) {
+      reading->problems.push_back(problem);
+      return;
+    }
+    reading->problems.push_back(problem + "; it stays in the library, without its metadata");
+    ContentType unread = type;
+    unread.container = Container::kNone;
+    const MetadataRequest request{unread, sideFile(file, &reading->problems),
+                                  options_.timezoneOffsetMinutes};
+    const ByteSource nothing{std::span<const std::uint8_t>()};
+    FolderAsset asset{file, type, readPhotoMetadata(nothing, request)};
+    reading->problems.insert(reading->problems.end(), asset.metadata.problems.begin(),
+                             asset.metadata.problems.end());
+    reading->asset = std::move(asset);
   }
 
   std::optional<std::string> sideFile(const ScannedFile& file,

@@ -163,6 +163,26 @@ def finish(process, timeout=RUN_SECONDS):
                     err.decode("utf-8", "surrogateescape"))
 
 
+class OrdinaryUser:
+    """Runs kxsync as a user whom permissions bind; for tests that root runs.
+
+    The programs are copied, since they may lie where only root may look.
+    """
+
+    NOBODY = 65534
+
+    def __init__(self, top):
+        os.chmod(top, 0o777)
+        self._bin = os.path.join(top, "bin")
+        os.mkdir(self._bin)
+        for name in ("kxsync", "kxsyncbundle.so"):
+            shutil.copy(os.path.join(BIN, name), self._bin)
+
+    def kxsync(self, *arguments):
+        return kxsync(*arguments, executable=os.path.join(self._bin, "kxsync"), user=self.NOBODY,
+                      group=self.NOBODY, extra_groups=[])
+
+
 class EndToEnd(unittest.TestCase):
     """A test with a directory of its own; self.host and self.device are paths in it."""
 

@@ -2,10 +2,9 @@
 
 import json
 import os
-import subprocess
 import unittest
 
-from harness import EndToEnd, KXSYNC, asset, environment, jpeg, kxsync, snapshot, tree_hash, uid
+from harness import EndToEnd, OrdinaryUser, asset, jpeg, kxsync, snapshot, tree_hash, uid
 
 COMMANDS = ("sync", "status", "dump", "show", "snapshot")
 
@@ -130,15 +129,8 @@ class UnusableHost(EndToEnd):
         self.write(os.path.join(self.host, "1.jpg"), jpeg())
         os.makedirs(os.path.join(self.host, "closed"))
         os.chmod(os.path.join(self.host, "closed"), 0)
-        os.chmod(self.top, 0o777)
-        done = subprocess.run(
-            ["setpriv", "--reuid=65534", "--regid=65534", "--clear-groups", KXSYNC, "sync",
-             self.host, self.device], capture_output=True, text=True, env=environment(),
-            check=False)
-        self.assertEqual(done.returncode, 1, done.stderr)
-        self.assertIn("closed", done.stderr)
-        self.assertEqual(done.stdout, "")
-        self.assertEqual(done.stderr.count("\n"), 1, done.stderr)
+        self.assert_clear_failure(OrdinaryUser(self.top).kxsync("sync", self.host, self.device), 1,
+                                  "closed")
 
 
 class UnusableDevice(EndToEnd):

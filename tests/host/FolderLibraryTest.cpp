@@ -1,12 +1,18 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <linux/filter.h>
+#include <linux/seccomp.h>
+#include <sys/prctl.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <sys/un.h>
 #include <unistd.h>
 
 #include <array>
+#include <cstddef>
 #include <cstring>
+#include <thread>
 
 #include "host/HostIdentity.h"
 #include "host/HostLibrary.h"
@@ -400,19 +406,96 @@ TEST(FolderLibrary, FoldersNestedTooDeeplyAreAnError) {
   EXPECT_EQ(openingErrorCode(folder.path()), static_cast<int>(HostError::kLimit));
 }
 
-TEST(FolderLibrary, AFolderThatCannotBeReadIsAnErrorAndAFileIsListed) {
+TEST(FolderLibrary, AFolderThatCannotBeReadIsAnError) {
   const TemporaryFolder folder;
   folder.write("a.jpg", jpeg());
-  folder.write("b.jpg", jpeg());
   folder.write("locked/c.jpg", jpeg());
   const AsOrdinaryUser user(folder);
-  ASSERT_EQ(::chmod(folder.at("b.jpg").c_str(), 0), 0);
-  ASSERT_EQ(::chmod(folder.at("locked").c_str(), 0), 0);
-  EXPECT_EQ(openingErrorCode(folder.path()), static_cast<int>(HostError::kUnreadable));
+  // Listing it and looking at what it holds take a right each.
+  for (const mode_t mode : {mode_t{0}, mode_t{0300}, mode_t{0600}}) {
+    ASSERT_EQ(::chmod(folder.at("locked").c_str(), mode), 0);
+    EXPECT_EQ(openingErrorCode(folder.path()), static_cast<int>(HostError::kUnreadable)) << mode;
+  }
   ASSERT_EQ(::chmod(folder.at("locked").c_str(), 0700), 0);
+  EXPECT_EQ(itemsOf(rootOf(*openHost(folder.path())), "Asset").size(), 2U);
+}
+
+TEST(FolderLibrary, AFileThatCannotBeReadStaysWithoutItsMetadata) {
+  const TemporaryFolder folder;
+  folder.write("Trip/b.jpg", photoTaken("2024:05:31 10:00:00"));
+  folder.write("Trip/film.MOV", std::string("\0\0\0\x14", 4) + "ftypqt  " + std::string(8, '\0'));
+  folder.write("notes.txt", "no photo");
+  const Value before = rootOf(*openHost(folder.path()));
+  const AsOrdinaryUser user(folder);
+  for (const char* name : {"Trip/b.jpg", "Trip/film.MOV", "notes.txt"})
+    ASSERT_EQ(::chmod(folder.at(name).c_str(), 0), 0);
   const auto library = openHost(folder.path());
-  EXPECT_EQ(itemsOf(rootOf(*library), "Asset").size(), 2U);
-  EXPECT_EQ(problemsOf(*library), "b.jpg: it cannot be read: Permission denied\n");
+  const Value root = rootOf(*library);
+  EXPECT_EQ(problemsOf(*library),
+            "Trip/b.jpg: it cannot be read: Permission denied; it stays in the library, without "
+            "its metadata\n"
+            "Trip/film.MOV: it cannot be read: Permission denied; it stays in the library, without "
+            "its metadata\n"
+            "notes.txt: it cannot be read: Permission denied\n");
+  EXPECT_EQ(itemsOf(root, "Asset").size(), 2U);
+  EXPECT_EQ(fileNamesOf(root, containerNamed(root, "Trip")), "b.jpg film.MOV");
+  const Value asset = assetNamed(root, "b.jpg");
+  for (const char* key : {"uuid", "modificationDate", "isVideo"})
+    EXPECT_EQ(asset[key], assetNamed(before, "b.jpg")[key]) << key;
+  EXPECT_EQ(asset["assetProperties"]["fileProperties"],
+            assetNamed(before, "b.jpg")["assetProperties"]["fileProperties"]);
+  EXPECT_TRUE(asset["exposureDate"].isNull());
+  EXPECT_TRUE(assetNamed(root, "film.MOV")["isVideo"].numberValue().boolValue());
+  ErrorPtr error;
+  EXPECT_FALSE(library->openMedia(asset["uuid"].stringValue(), &error).has_value());
+  EXPECT_EQ(error->code(), EACCES);
+}
+
+TEST(FolderLibrary, WhatTheSideFileSaysOfAFileThatCannotBeReadCounts) {
+  const TemporaryFolder folder;
+  folder.write("a.jpg", jpeg());
+  folder.write("a.xmp", xmpPacket("xmp:Rating=\"4\" exif:GPSLatitude=\"46,30N\" "
+                                  "exif:GPSLongitude=\"7,30W\""));
+  const AsOrdinaryUser user(folder);
+  ASSERT_EQ(::chmod(folder.at("a.jpg").c_str(), 0), 0);
+  const Value asset = assetNamed(rootOf(*openHost(folder.path())), "a.jpg");
+  EXPECT_EQ(asset["rating"].numberValue().int64Value(), 4);
+  EXPECT_DOUBLE_EQ(real(asset["longitude"]), -7.5);
+}
+
+// Makes every positioned read of this thread fail, for good.
+void failReadsOfThisThread() {
+  std::array<sock_filter, 4> filter{
+      sock_filter BPF_STMT(BPF_LD | BPF_W | BPF_ABS, offsetof(seccomp_data, nr)),
+      sock_filter BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, SYS_pread64, 0, 1),
+      sock_filter BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ERRNO | EIO),
+      sock_filter BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW)};
+  const sock_fprog program{filter.size(), filter.data()};
+  ASSERT_EQ(::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0), 0);
+  ASSERT_EQ(::prctl(PR_SET_SECCOMP, SECCOMP_MODE_FILTER, &program), 0);
+}
+
+TEST(FolderLibrary, AFileWhoseReadingFailsStays) {
+  const TemporaryFolder folder;
+  folder.write("Trip/a.jpg", jpeg());
+  folder.write("Trip/plain", jpeg());
+  folder.write("Trip/notes.txt", "no photo");
+  std::unique_ptr<HostLibrary> library;
+  std::thread([&] {
+    failReadsOfThisThread();
+    HostOptions options;
+    options.threads = 1;  // this one
+    library = openHost(folder.path(), options);
+  }).join();
+  ASSERT_NE(library, nullptr);
+  const Value root = rootOf(*library);
+  EXPECT_EQ(fileNamesOf(root, containerNamed(root, "Trip")), "a.jpg plain");
+  EXPECT_EQ(problemsOf(*library),
+            "Trip/a.jpg: it cannot be read: Input/output error; it stays in the library, without "
+            "its metadata\n"
+            "Trip/notes.txt: it cannot be read: Input/output error\n"
+            "Trip/plain: it cannot be read: Input/output error; it stays in the library, without "
+            "its metadata\n");
 }
 
 TEST(FolderLibrary, AFolderThatKeepsChangingIsAnError) {
