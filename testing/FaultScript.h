@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstddef>
 #include <deque>
 #include <mutex>
 #include <optional>
@@ -22,9 +23,16 @@ class FaultScript {
     std::string kind;         // what the point's own arguments say
   };
 
-  void arm(Fault fault) {
+  // Faults that are armed and have not been hit as often as they shall: no more than these.
+  static constexpr std::size_t kMostArmed = 1024;
+
+  // False, and nothing done, when there are too many.
+  bool arm(Fault fault) {
     const std::lock_guard<std::mutex> lock(mutex_);
-    if (fault.times > 0) faults_.push_back(std::move(fault));
+    if (fault.times == 0) return true;
+    if (faults_.size() >= kMostArmed) return false;
+    faults_.push_back(std::move(fault));
+    return true;
   }
 
   void clear() {

@@ -1,6 +1,8 @@
 #include "testing/FaultySaver.h"
 
 #include <condition_variable>
+#include <deque>
+#include <iterator>
 #include <utility>
 
 #include "platform/dispatch/Dispatch.h"
@@ -11,7 +13,9 @@ namespace kx {
 struct FaultySaver::Shared {
   std::mutex mutex;
   std::map<const Data*, bool> finishedBlocks;  // of serialized jobs not handed over yet
-  std::vector<Batch> batches;
+  std::deque<Batch> batches;
+  std::size_t jobs = 0;       // in batches
+  std::size_t forgotten = 0;  // batches
   bool mayHold = true;
   bool holding = false;
   std::vector<Held> held;
@@ -70,6 +74,17 @@ FaultySaver::Batch FaultySaver::observe(const std::vector<DataPtr>& jobs) {
   return batch;
 }
 
+// With the lock held.
+void FaultySaver::keep(Batch observed) {
+  shared_->jobs += observed.size();
+  shared_->batches.push_back(std::move(observed));
+  while (shared_->jobs > kMostJobsKept && shared_->batches.size() > 1) {
+    shared_->jobs -= shared_->batches.front().size();
+    shared_->batches.pop_front();
+    ++shared_->forgotten;
+  }
+}
+
 void FaultySaver::saveSyncedAssets(std::vector<DataPtr> serializedJobs, Completion completion) {
   Held batch{std::move(serializedJobs), std::move(completion)};
   {
@@ -80,7 +95,7 @@ void FaultySaver::saveSyncedAssets(std::vector<DataPtr> serializedJobs, Completi
       batch.cleansUp = true;
       batch.isAwaited = batch.isAwaited || job.hasFinishedBlock;
     }
-    shared_->batches.push_back(std::move(observed));
+    keep(std::move(observed));
     if (!shared_->holding && shared_->mayHold && script_.take("saverHold")) shared_->holding = true;
     if (shared_->holding) {
       shared_->held.push_back(std::move(batch));
@@ -132,9 +147,20 @@ void FaultySaver::keepBack(Held batch) {
                           });
 }
 
-std::vector<FaultySaver::Batch> FaultySaver::takeBatches() {
+FaultySaver::Record FaultySaver::takeBatches() {
   const std::lock_guard<std::mutex> lock(shared_->mutex);
-  return std::exchange(shared_->batches, {});
+  Record record;
+  record.batches.assign(std::make_move_iterator(shared_->batches.begin()),
+                        std::make_move_iterator(shared_->batches.end()));
+  record.forgotten = std::exchange(shared_->forgotten, 0);
+  shared_->batches.clear();
+  shared_->jobs = 0;
+  return record;
+}
+
+std::size_t FaultySaver::heldBatches() const {
+  const std::lock_guard<std::mutex> lock(shared_->mutex);
+  return shared_->held.size();
 }
 
 bool FaultySaver::isHolding() const {

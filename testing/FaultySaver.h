@@ -34,9 +34,16 @@ class FaultySaver final : public KXAssetsSaver {
   KXSyncSaveJobPtr newSyncSaveJob() override;
   void saveSyncedAssets(std::vector<DataPtr> serializedJobs, Completion completion) override;
 
-  // The batches handed over since the last call, oldest first.
-  std::vector<Batch> takeBatches();
+  // The record keeps this many jobs that nobody takes; older batches leave it.
+  static constexpr std::size_t kMostJobsKept = 20'000;
+  struct Record {
+    std::vector<Batch> batches;  // oldest first
+    std::size_t forgotten = 0;   // batches before them that left the record
+  };
+  // The batches handed over since the last call.
+  Record takeBatches();
   bool isHolding() const;
+  std::size_t heldBatches() const;
   // Hands over what was held, in order, and holds no more.
   void release();
   // Whether "saverHold" may take hold from now on. Without, what was held is released.
@@ -57,6 +64,7 @@ class FaultySaver final : public KXAssetsSaver {
   void handOver(Held batch);
   void keepBack(Held batch);
   Batch observe(const std::vector<DataPtr>& jobs);
+  void keep(Batch observed);
 
   KXAssetsSaver& inner_;
   FaultScript& script_;

@@ -16,6 +16,7 @@ class ManualMemoryPressure {
     auto source = std::make_shared<DispatchSource>(queue_);
     std::lock_guard<std::mutex> lock(mutex_);
     ++made_;
+    std::erase_if(sources_, [](const auto& weak) { return weak.expired(); });
     sources_.push_back(source);
     return std::make_unique<Handle>(std::move(source));
   }

@@ -9,8 +9,10 @@ namespace {
 
 using Json = nlohmann::ordered_json;
 
-// Requests that outstandingAssetTransfers has listed stay addressable for the session's life.
+// Requests that outstandingAssetTransfers has listed stay addressable for the session's life,
+// unless there are more than so many.
 using KnownRequests = std::map<std::string, FRAssetPtr>;
+constexpr std::size_t kMostKnown = 1'000'000;
 
 Json requestJson(const FRAsset& request) {
   return {{"identifier", request.identifier()},
@@ -91,6 +93,7 @@ void addTransferCalls(DriveSession& session, DriveCallTable& table) {
       DriveLane::kPlugin, [&session, known](const DriveArguments&) {
         DriveAnswer answer;
         answer.result = Json::array();
+        if (known->size() > kMostKnown) known->clear();
         for (const FRAssetPtr& request : session.client().outstandingAssetTransfers()) {
           (*known)[request->identifier()] = request;
           answer.result.push_back(requestJson(*request));

@@ -91,11 +91,20 @@ Json jobJson(const FaultySaver::Job& job, const std::map<std::string, std::strin
       {"hasFinishedBlock", job.hasFinishedBlock}};
 }
 
+// A list with a gap would say what never happened.
+void refuseGaps(std::size_t forgotten, const char* what) {
+  if (forgotten == 0) return;
+  throw DriveException("TooManyKept",
+                       "nobody took the record for too long: " + std::to_string(forgotten) + " " +
+                           what + " have left it, and it begins anew");
+}
+
 DriveAnswer jobs(DriveSession& session) {
-  const std::vector<FaultySaver::Batch> taken = session.platform().saver().takeBatches();
+  const FaultySaver::Record taken = session.platform().saver().takeBatches();
+  refuseGaps(taken.forgotten, "batches");
   const std::map<std::string, std::string> containers = containersByURI(session);
   Json batches = Json::array();
-  for (const FaultySaver::Batch& batch : taken) {
+  for (const FaultySaver::Batch& batch : taken.batches) {
     Json list = Json::array();
     for (const FaultySaver::Job& job : batch) list.push_back(jobJson(job, containers));
     batches.push_back(std::move(list));
@@ -104,8 +113,10 @@ DriveAnswer jobs(DriveSession& session) {
 }
 
 DriveAnswer porterCalls(DriveSession& session) {
+  const ObservedPorter::Record taken = session.platform().porter().takeCalls();
+  refuseGaps(taken.forgotten, "calls");
   Json calls = Json::array();
-  for (const ObservedPorter::Call& call : session.platform().porter().takeCalls()) {
+  for (const ObservedPorter::Call& call : taken.calls) {
     if (call.isUpdate) {
       calls.push_back({"updateRestoredAsset", orNull(call.uuid), call.paths});
     } else {

@@ -17,6 +17,8 @@ using Json = nlohmann::ordered_json;
 constexpr std::size_t kLongestLineBytes = 64U << 20;
 // Answers of asynchronous calls are kept until they are collected: no more than these.
 constexpr std::size_t kMostStarted = 256;
+// Batches that wait for "saverHold" to end: no more than these.
+constexpr std::size_t kMostHeld = 1024;
 
 // Reads a line without its end; false at the end of the input. `tooLong` lines are read to their
 // end and given up.
@@ -123,6 +125,9 @@ DriveConsole::Outcome DriveConsole::dispatch(const Json& line, const std::string
   const auto found = table_.find(name);
   if (found == table_.end()) throw DriveException(kUnknownCall, "unknown call \"" + name + "\"");
   const DriveCall& call = found->second;
+  if (call.lane == DriveLane::kPlugin && session_.platform().saver().heldBatches() >= kMostHeld) {
+    throw DriveException("TooManyHeld", "device.releaseSaver lets go what the saver holds");
+  }
   if (arguments.boolean("async", false)) {
     start(name, call, line, extra);
     return {};

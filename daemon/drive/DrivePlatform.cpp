@@ -9,24 +9,26 @@ namespace kx {
 
 void ObservedPorter::updateRestoredAssetWithUUID(const std::optional<std::string>& uuid,
                                                  const std::vector<std::string>& paths) {
-  {
-    const std::lock_guard<std::mutex> lock(mutex_);
-    calls_.push_back({true, uuid, paths, false});
-  }
+  keep({true, uuid, paths, false});
   inner_.updateRestoredAssetWithUUID(uuid, paths);
 }
 
 void ObservedPorter::finalizeOTARestoreRecreatingAlbums(bool recreateAlbums) {
-  {
-    const std::lock_guard<std::mutex> lock(mutex_);
-    calls_.push_back({false, std::nullopt, {}, recreateAlbums});
-  }
+  keep({false, std::nullopt, {}, recreateAlbums});
   inner_.finalizeOTARestoreRecreatingAlbums(recreateAlbums);
 }
 
-std::vector<ObservedPorter::Call> ObservedPorter::takeCalls() {
+void ObservedPorter::keep(Call call) {
   const std::lock_guard<std::mutex> lock(mutex_);
-  return std::exchange(calls_, {});
+  record_.calls.push_back(std::move(call));
+  if (record_.calls.size() <= kMostCallsKept) return;
+  record_.calls.pop_front();
+  ++record_.forgotten;
+}
+
+ObservedPorter::Record ObservedPorter::takeCalls() {
+  const std::lock_guard<std::mutex> lock(mutex_);
+  return std::exchange(record_, {});
 }
 
 namespace {

@@ -1,5 +1,7 @@
 #pragma once
 
+#include <cstddef>
+#include <deque>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -31,12 +33,20 @@ class ObservedPorter final : public KXPorterClient {
   void updateRestoredAssetWithUUID(const std::optional<std::string>& uuid,
                                    const std::vector<std::string>& paths) override;
   void finalizeOTARestoreRecreatingAlbums(bool recreateAlbums) override;
-  std::vector<Call> takeCalls();  // since the last call
+  // The record keeps this many calls that nobody takes; older ones leave it.
+  static constexpr std::size_t kMostCallsKept = 20'000;
+  struct Record {
+    std::deque<Call> calls;
+    std::size_t forgotten = 0;  // before them
+  };
+  Record takeCalls();  // since the last call
 
  private:
+  void keep(Call call);
+
   KXPorterClient& inner_;
   std::mutex mutex_;
-  std::vector<Call> calls_;
+  Record record_;
 };
 
 // What the backup manager answers: the platform's own answer until a script says another.

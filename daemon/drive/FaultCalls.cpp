@@ -36,7 +36,9 @@ DriveAnswer armFault(DriveSession& session, const DriveArguments& arguments) {
     fault.error =
         Error::make(kPosixErrorDomain, arguments.integerWithin("errno", 1, INT32_MAX, EIO));
   }
-  session.faults().arm(std::move(fault));
+  if (!session.faults().arm(std::move(fault))) {
+    throw DriveException("TooManyFaults", "device.clearFaults makes room for more");
+  }
   return {};
 }
 

@@ -111,7 +111,6 @@ class ClientCalls(ConsoleTest):
         self.assertEqual((answer["call"], answer["result"]), ("prepareForSync", True))
         self.assertEqual(self.console.raw("wait", of=1)["exception"]["name"], "BadArgument")
 
-
     def test_answers_that_nobody_collects_are_bounded(self):
         for _ in range(256):
             self.console.raw("currentSyncAnchor", **{"async": True})
@@ -119,6 +118,48 @@ class ClientCalls(ConsoleTest):
         self.assertEqual(answer["exception"]["name"], "TooManyStarted")
         self.assertEqual(self.console.raw("wait", of=1)["result"], "1")
         self.assertIn("started", self.console.raw("currentSyncAnchor", **{"async": True}))
+
+    def test_faults_that_never_hit_are_bounded(self):
+        for _ in range(1024):
+            self.call("device.fault", point="statfs", skip=1)
+        with self.assertRaises(Raised) as raised:
+            self.call("device.fault", point="statfs")
+        self.assertEqual(raised.exception.name, "TooManyFaults")
+        self.call("device.clearFaults")
+        self.call("device.fault", point="statfs")
+
+    def begin_with_many(self, count):
+        """A sync that asks for that many files, of which none is there."""
+        requested = self.begin([asset(uid(number)) for number in range(count)])
+        self.assertEqual(len(requested), count)
+        return requested
+
+    def test_held_batches_are_bounded(self):
+        requested = self.begin_with_many(1025)
+        self.call("device.fault", point="saverHold")
+        for identifier in requested[:1024]:
+            self.call("device.advanceClock", seconds=4)
+            self.call("assetTransfer", identifier=identifier, path="Photos/Sync/Staging/none")
+        with self.assertRaises(Raised) as raised:
+            self.call("assetTransfer", identifier=requested[1024], path="Photos/Sync/Staging/none")
+        self.assertEqual(raised.exception.name, "TooManyHeld")
+        self.call("device.releaseSaver")
+        self.call("assetTransfer", identifier=requested[1024], path="Photos/Sync/Staging/none")
+        self.assertEqual(len(self.call("device.jobs")), 1025)
+
+    def test_record_of_jobs_that_nobody_takes_is_bounded_and_tells_of_its_gap(self):
+        requested = self.begin_with_many(20001)
+        self.call("device.advanceClock", seconds=4)
+        self.call("assetTransfer", identifier=requested[0], path="Photos/Sync/Staging/none")
+        self.call("device.fault", point="saver")  # no job of the second batch is worked
+        for identifier in requested[1:]:
+            self.call("assetTransfer", identifier=identifier, path="Photos/Sync/Staging/none")
+        self.call("device.advanceClock", seconds=4)
+        self.finish(False)
+        with self.assertRaises(Raised) as raised:
+            self.call("device.jobs")
+        self.assertEqual(raised.exception.name, "TooManyKept")
+        self.assertEqual(self.call("device.jobs"), [])
 
 
 class MemoryPressure(ConsoleTest):

@@ -123,7 +123,9 @@ class RandomLines(unittest.TestCase):
             writer.join()
             if warm is None and start >= LINES // 4:
                 warm = resident_kib(process)
-        grown = resident_kib(process) - warm
+        last = resident_kib(process)
+        print(f"resident: {warm} KiB after a quarter of the lines, {last} KiB after all")
+        grown = last - warm
         process.stdin.close()
         self.assertEqual(process.wait(timeout=60), 0)
         process.stdout.close()
