@@ -11,7 +11,7 @@ namespace kx::cli {
 
 namespace {
 
-constexpr const char* kExamples =
+constexpr const char* kDumpExamples =
     "Examples:\n"
     "  kxsync dump ./device                    all that the library holds, indented\n"
     "  kxsync dump ./device --json --hash      on one line, with the SHA-256 of every file";
@@ -42,7 +42,7 @@ void addDumpCommand(CLI::App& app, Action& chosen) {
       ->required()
       ->type_name("PATH");
   command->add_flag("--hash", arguments->hash, "Add the SHA-256 of every asset's file");
-  command->footer(kExamples);
+  command->footer(kDumpExamples);
   command->callback([arguments, &chosen] {
     chosen = [arguments](Context& context) { return runDump(context, *arguments); };
   });

@@ -20,7 +20,7 @@ namespace kx::cli {
 
 namespace {
 
-constexpr const char* kExamples =
+constexpr const char* kShowExamples =
     "Examples:\n"
     "  kxsync show ./bundle/PhotoLibrary.plist             library, containers and assets\n"
     "  kxsync show ./bundle/PhotoLibrary.plist --summary   counts alone\n"
@@ -127,7 +127,7 @@ void addShowCommand(CLI::App& app, Action& chosen) {
       ->required()
       ->type_name("PATH");
   command->add_flag("--summary", arguments->summary, "Print counts alone");
-  command->footer(kExamples);
+  command->footer(kShowExamples);
   command->callback([arguments, &chosen] {
     chosen = [arguments](Context& context) { return runShow(context, *arguments); };
   });

@@ -12,7 +12,7 @@ namespace kx::cli {
 
 namespace {
 
-constexpr const char* kExamples =
+constexpr const char* kSnapshotExamples =
     "Examples:\n"
     "  kxsync snapshot ~/Pictures ./bundle           write a host bundle of a folder\n"
     "  kxsync show ./bundle/PhotoLibrary.plist       look at its snapshot\n"
@@ -72,7 +72,7 @@ void addSnapshotCommand(CLI::App& app, Action& chosen) {
       ->required()
       ->type_name("PATH");
   addFolderReadingOptions(*command, arguments->reading);
-  command->footer(kExamples);
+  command->footer(kSnapshotExamples);
   command->callback([arguments, &chosen] {
     chosen = [arguments](Context& context) { return runSnapshot(context, *arguments); };
   });

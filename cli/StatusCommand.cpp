@@ -12,7 +12,7 @@ namespace kx::cli {
 
 namespace {
 
-constexpr const char* kExamples =
+constexpr const char* kStatusExamples =
     "Examples:\n"
     "  kxsync status ./device            albums, events and face albums with their counts\n"
     "  kxsync status ./device --json     the same for a script";
@@ -158,7 +158,7 @@ void addStatusCommand(CLI::App& app, Action& chosen) {
   command->add_option("DEVICE", *root, "The directory of the device")
       ->required()
       ->type_name("PATH");
-  command->footer(kExamples);
+  command->footer(kStatusExamples);
   command->callback(
       [root, &chosen] { chosen = [root](Context& context) { return runStatus(context, *root); }; });
 }

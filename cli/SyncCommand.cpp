@@ -18,7 +18,7 @@ namespace kx::cli {
 
 namespace {
 
-constexpr const char* kExamples =
+constexpr const char* kSyncExamples =
     "Examples:\n"
     "  kxsync sync ~/Pictures ./device                  a folder of photos\n"
     "  kxsync sync ./bundle ./device --json             a host bundle, the result for a script\n"
@@ -163,7 +163,7 @@ void addSyncCommand(CLI::App& app, Action& chosen) {
   command->add_flag("--allow-deletes", arguments->allowDeletes,
                     "Let this sync take away more than half of the synced photos");
   addFolderReadingOptions(*command, arguments->reading);
-  command->footer(kExamples);
+  command->footer(kSyncExamples);
   command->callback([arguments, &chosen] {
     chosen = [arguments](Context& context) { return runSync(context, *arguments); };
   });

@@ -4,12 +4,12 @@
 #include <unordered_map>
 
 #include "client/KXSyncClient.h"
+#include "client/LogSource.h"
 #include "platform/foundation/PropertyList.h"
 
 namespace kx {
 namespace {
 
-constexpr const char* kSource = "KXSyncClient";
 constexpr std::size_t kNoPlace = std::numeric_limits<std::size_t>::max();
 
 using HostIndex = std::unordered_map<std::string_view, std::size_t>;
@@ -28,7 +28,7 @@ class ContainersOfList {
   void add(const KXGenericAlbumPtr& container) {
     const auto place = places_.find(container.get());
     if (place == places_.end()) {
-      KX_LOG(kSource, "_reconcileDeviceAlbumListSortingWithAlbums", LogLevel::kError,
+      KX_LOG(kClientSource, "_reconcileDeviceAlbumListSortingWithAlbums", LogLevel::kError,
              missingMessage_, container);
       return;
     }
@@ -110,7 +110,7 @@ void KXSyncClient::_reconcileDeviceAlbumListSortingWithAlbums(const DeviceAlbumM
         faceAlbums.add(container);
         break;
       default:
-        KX_LOG(kSource, "_reconcileDeviceAlbumListSortingWithAlbums", LogLevel::kInfo,
+        KX_LOG(kClientSource, "_reconcileDeviceAlbumListSortingWithAlbums", LogLevel::kInfo,
                "_reconcileDeviceAlbumListSortingWithAlbums found an album of an unexpected kind %@",
                container);
     }
@@ -134,7 +134,7 @@ void KXSyncClient::_reorderAlbumListProxy(KXManagedAlbumList& list,
   const std::span<const KXGenericAlbumPtr> albums = list.albums();
   if (albums.empty()) return;
   if (indexes.size() != newOrder.size()) {
-    KX_LOG(kSource, "_reorderAlbumListProxy", LogLevel::kError,
+    KX_LOG(kClientSource, "_reorderAlbumListProxy", LogLevel::kError,
            "ERROR in _reorderAlbumListProxy, different count for existingAlbumIndexes and "
            "newAlbumOrderArray");
     return;
@@ -198,7 +198,7 @@ void KXSyncClient::_persistAssetAlbumOrderStructures() {
   const std::vector<std::uint8_t> bytes =
       writePropertyList(Value::dictionary(std::move(orders)), PropertyListFormat::kBinary, nullptr);
   if (bytes.empty() || !platform_.files().writeFileAtomically(path, bytes, nullptr)) {
-    KX_LOG(kSource, "_persistAssetAlbumOrderStructures", LogLevel::kError,
+    KX_LOG(kClientSource, "_persistAssetAlbumOrderStructures", LogLevel::kError,
            "Failed to write assetOrdersByAlbumUUID to path %@", path);
   }
   framework.clearAssetOrderByAbumUUIDs();

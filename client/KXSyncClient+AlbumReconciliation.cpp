@@ -2,14 +2,14 @@
 #include <unordered_set>
 
 #include "client/KXSyncClient.h"
+#include "client/LogSource.h"
 #include "platform/foundation/Text.h"
 #include "records/KXSFolder.h"
 
 namespace kx {
 namespace {
 
-constexpr const char* kSource = "KXSyncClient";
-constexpr const char* kFunction = "_reconcileAlbums";
+constexpr const char* kReconcileAlbums = "_reconcileAlbums";
 constexpr const char* kThumbnailExtension = ".JPG";
 constexpr std::int64_t kFaceAlbumSubclass = 3;
 constexpr std::int64_t kEventAlbumSubclass = 4;
@@ -89,7 +89,7 @@ void KXSyncClient::_reconcileAlbums(const DispatchGroupPtr& group) {
 }
 
 void KXSyncClient::reconcileAlbumsInTransaction() {
-  KX_LOG(kSource, kFunction, LogLevel::kInfo, "Transaction for album reconciliation");
+  KX_LOG(kClientSource, kReconcileAlbums, LogLevel::kInfo, "Transaction for album reconciliation");
   DeviceAlbumMap onDevice = _onDeviceAlbumsByUUID();
   std::vector<Value> kept = deleteAlbums(onDevice);
   createAlbums(onDevice, kept);
@@ -121,8 +121,8 @@ bool KXSyncClient::deleteAlbum(DeviceAlbumMap& onDevice, std::string_view uuid) 
   const KXGenericAlbumPtr album = *onDevice.find(uuid);
   KXManagedAlbum* const managed = album->asManagedAlbum();
   if (managed == nullptr) {
-    KX_LOG(kSource, kFunction, LogLevel::kError, "can't delete album because it's not of type %@",
-           KXManagedAlbum::kClassName);
+    KX_LOG(kClientSource, kReconcileAlbums, LogLevel::kError,
+           "can't delete album because it's not of type %@", KXManagedAlbum::kClassName);
     return false;
   }
   if (managed->kindValue() == kKXAlbumKindSyncedFaceAlbum) {
@@ -145,7 +145,7 @@ void KXSyncClient::removeFaceThumbnail(std::string_view uuid) {
     return;
   }
   if (!error) return;
-  KX_LOG(kSource, kFunction, LogLevel::kWarning,
+  KX_LOG(kClientSource, kReconcileAlbums, LogLevel::kWarning,
          "Could not remove face thumbnail at path %@ Error: %@", path, error);
 }
 
@@ -159,7 +159,7 @@ void KXSyncClient::createAlbums(DeviceAlbumMap& onDevice, const std::vector<Valu
     const KXSItem& record = *entry.value;
     const ContainerForm form = formOf(record);
     const OptionalString uuid = record.uuid();
-    KX_LOG(kSource, kFunction, LogLevel::kInfo,
+    KX_LOG(kClientSource, kReconcileAlbums, LogLevel::kInfo,
            "Creating managed album with name %@, uuid: %@, kind: %d!", form.name, uuid, form.kind);
     const KXGenericAlbumPtr album =
         _addAlbumNamed(form.name, uuid.value_or(std::string_view()), form.kind);
@@ -177,8 +177,8 @@ void KXSyncClient::renameAndSortAlbums(const DeviceAlbumMap& onDevice,
     if (album == nullptr || record == nullptr) continue;
     const std::optional<OptionalString> name = nameOf(**record);
     if (name && *name != (*album)->title()) {
-      KX_LOG(kSource, kFunction, LogLevel::kInfo, "Updating album %@ to have title %@", *album,
-             *name);
+      KX_LOG(kClientSource, kReconcileAlbums, LogLevel::kInfo, "Updating album %@ to have title %@",
+             *album, *name);
       (*album)->setTitle(*name);
     }
     if (KXManagedAlbum* const managed = (*album)->asManagedAlbum()) {

@@ -10,7 +10,7 @@
 namespace kx {
 namespace {
 
-constexpr const char* kSource = "KXSyncClient+AssetMetrics";
+constexpr const char* kAssetMetricsSource = "KXSyncClient+AssetMetrics";
 constexpr const char* kBackupLockPath = "/tmp/BackupRunning";
 constexpr const char* kIsolationQueueLabel = "com.veltro.photoSyncClient.isolation";
 constexpr std::uint32_t kDefaultBlockSize = 4096;
@@ -62,9 +62,10 @@ DispatchQueuePtr isolationQueue(Platform& platform) {
 
 Value KXSyncClient::installedAssetMetrics() {
   constexpr const char* kFunction = "installedAssetMetrics";
-  KX_LOG(kSource, kFunction, LogLevel::kInfo, "installedAssetMetrics");
+  KX_LOG(kAssetMetricsSource, kFunction, LogLevel::kInfo, "installedAssetMetrics");
   if (backupIsRunning(platform_.files())) {
-    KX_LOG(kSource, kFunction, LogLevel::kInfo, "Restore in progress, returning empty metrics");
+    KX_LOG(kAssetMetricsSource, kFunction, LogLevel::kInfo,
+           "Restore in progress, returning empty metrics");
     return Value::dictionary({});
   }
   Value result;
@@ -100,8 +101,8 @@ Value KXSyncClient::measureAssets(KXManagedObjectContext& context) {
   Value result = Value::dictionary(
       {{kKXPhotoDataclass, metrics(blockSize * (syncedBlocks + syncedShare * extra), syncedCount)},
        {kShoebox, metrics(blockSize * (otherShare * extra + otherBlocks), otherCount)}});
-  KX_LOG(kSource, "installedAssetMetrics", LogLevel::kInfo, "Installed Asset Metrics (Photos): %@",
-         result);
+  KX_LOG(kAssetMetricsSource, "installedAssetMetrics", LogLevel::kInfo,
+         "Installed Asset Metrics (Photos): %@", result);
   return result;
 }
 
@@ -110,7 +111,7 @@ std::uint64_t KXSyncClient::_assetCountInManagedObjectContext(KXManagedObjectCon
   ErrorPtr error;
   const std::optional<std::uint64_t> count = context.countAssets(predicateFor(synced), &error);
   if (count) return *count;
-  KX_LOG(kSource, "_assetCountInManagedObjectContext", LogLevel::kError,
+  KX_LOG(kAssetMetricsSource, "_assetCountInManagedObjectContext", LogLevel::kError,
          "Error getting asset count: %@", error);
   return 0;
 }
@@ -158,8 +159,8 @@ std::uint64_t KXSyncClient::_extraFileBlockCount() {
   std::uint64_t total = 0;
   const auto onEntry = [&](const FileProperties& entry) {
     if (entry.error) {
-      KX_LOG(kSource, kFunction, LogLevel::kWarning, "Error getting properties of file \"%@\": %@",
-             entry.path, entry.error);
+      KX_LOG(kAssetMetricsSource, kFunction, LogLevel::kWarning,
+             "Error getting properties of file \"%@\": %@", entry.path, entry.error);
       return EnumerationChoice::kDescend;
     }
     total += blocksOf(entry.fileSize, blockSize);
@@ -172,8 +173,8 @@ std::uint64_t KXSyncClient::_extraFileBlockCount() {
   for (const std::string& base : _allAssetMetricBaseURLs()) {
     files.enumerate(base, onEntry, [&base](const std::string& /*path*/, const ErrorPtr& error) {
       if (error && isNoSuchFile(*error)) return;
-      KX_LOG(kSource, kFunction, LogLevel::kError, "Error enumerating files inside \"%@\": %@",
-             base, error);
+      KX_LOG(kAssetMetricsSource, kFunction, LogLevel::kError,
+             "Error enumerating files inside \"%@\": %@", base, error);
     });
   }
   return total;
@@ -186,7 +187,7 @@ std::uint32_t KXSyncClient::_fileSystemBlockSize() {
     const std::uint32_t size = platform.files().blockSize(platform.mobileHomeDirectory(), &error);
     if (!error) return size;
     // For the sync log alone, and from the framework's facility.
-    const LogSite site{kSource, "_fileSystemBlockSize", __LINE__, kLogFacility};
+    const LogSite site{kAssetMetricsSource, "_fileSystemBlockSize", __LINE__, kLogFacility};
     const auto number = static_cast<int>(error->code());
     writeSyncLog(site, LogLevel::kError,
                  "statfs(2) failed. Unable to get file system block size: %s (%d)",

@@ -3,14 +3,14 @@
 #include <limits>
 
 #include "client/KXSyncClient.h"
+#include "client/LogSource.h"
 #include "client/Memberships.h"
 #include "records/TesselDates.h"
 
 namespace kx {
 namespace {
 
-constexpr const char* kSource = "KXSyncClient";
-constexpr const char* kFunction = "_reconcileAssets";
+constexpr const char* kReconcileAssets = "_reconcileAssets";
 constexpr double kTokenEpsilon = 2.220446049250313e-16;
 constexpr double kTieStepDivisor = 100000.0;
 constexpr double kNoPreviousTime = -1.0;
@@ -89,7 +89,7 @@ std::optional<KXSyncClient::DeviceAssetMap> KXSyncClient::_onDeviceAssetsByUUID(
   ErrorPtr error;
   const auto assets = library_->managedObjectContext().fetchAssets(request, &error);
   if (!assets) {
-    KX_LOG(kSource, "_onDeviceAssetsByUUID", LogLevel::kError,
+    KX_LOG(kClientSource, "_onDeviceAssetsByUUID", LogLevel::kError,
            "Error Reconciling Photos: Cannot fetch on device photos %@", error);
     return std::nullopt;
   }
@@ -126,7 +126,7 @@ void KXSyncClient::computeSortTokens() {
 }
 
 void KXSyncClient::reconcileAssetsInTransaction() {
-  KX_LOG(kSource, kFunction, LogLevel::kInfo, "Transaction for Reconciling Assets");
+  KX_LOG(kClientSource, kReconcileAssets, LogLevel::kInfo, "Transaction for Reconciling Assets");
   AssetReconciliation run;
   // A failed fetch counts as a device without synced assets.
   if (std::optional<DeviceAssetMap> assets = _onDeviceAssetsByUUID()) {
@@ -151,13 +151,14 @@ void KXSyncClient::deleteAssets(AssetReconciliation& run) {
     const std::string_view uuid = key.stringValue();
     const KXManagedAssetPtr* found = run.deviceAssets.find(uuid);
     if (found == nullptr || !*found) {
-      KX_LOG(kSource, kFunction, LogLevel::kWarning, "couldn't find photo with id %@", uuid);
+      KX_LOG(kClientSource, kReconcileAssets, LogLevel::kWarning, "couldn't find photo with id %@",
+             uuid);
       continue;
     }
     const KXManagedAssetPtr asset = *found;
     deleteWithFaces(*asset);
     run.deviceAssets.remove(uuid);
-    KX_LOG(kSource, kFunction, LogLevel::kInfo, "deleted photo with %@ is %p", uuid,
+    KX_LOG(kClientSource, kReconcileAssets, LogLevel::kInfo, "deleted photo with %@ is %p", uuid,
            static_cast<const void*>(asset.get()));
     asset->deleteObject();
   }
@@ -175,7 +176,8 @@ void KXSyncClient::requestDownload(std::string_view uuid, const KXSAsset& host) 
   const FRAssetPtr request = FRAsset::downloadAssetWithIdentifier(
       std::string(uuid), kKXPhotoDataclass,
       caption ? std::optional<std::string>(*caption) : std::nullopt);
-  KX_LOG(kSource, kFunction, LogLevel::kInfo, "Download request for asset: %@", request);
+  KX_LOG(kClientSource, kReconcileAssets, LogLevel::kInfo, "Download request for asset: %@",
+         request);
   if (const std::shared_ptr<TransferList> list = outstandingAssets()) list->append(request);
 }
 
@@ -206,11 +208,11 @@ bool KXSyncClient::deleteAssetIfStale(AssetReconciliation& run, std::string_view
   if (onDevice && onDevice->secondsSinceReference == secondsOf(host.modificationDate())) {
     return false;
   }
-  KX_LOG(kSource, kFunction, LogLevel::kInfo, "Deleting stale asset: %@", device);
+  KX_LOG(kClientSource, kReconcileAssets, LogLevel::kInfo, "Deleting stale asset: %@", device);
   run.deviceAssets.remove(uuid);
   deleteWithFaces(*device);
   device->deleteObject();
-  KX_LOG(kSource, kFunction, LogLevel::kInfo,
+  KX_LOG(kClientSource, kReconcileAssets, LogLevel::kInfo,
          "=========== ASSET %@ HAS CHANGED, RE-REQUESTING DOWNLOAD", uuid);
   requestDownload(uuid, host);
   return true;
@@ -230,12 +232,12 @@ void KXSyncClient::updateLocation(KXManagedAsset& device, const KXSAsset& host) 
   if (latitude && longitude) coordinate = {latitude->doubleValue(), longitude->doubleValue()};
   if (device.isLocatedAtCoordinates(coordinate)) return;
   if (!canUseCoordinate(coordinate)) {
-    KX_LOG(kSource, kFunction, LogLevel::kInfo, "Removing location for asset");
+    KX_LOG(kClientSource, kReconcileAssets, LogLevel::kInfo, "Removing location for asset");
     device.setLocation(std::nullopt);
     return;
   }
-  KX_LOG(kSource, kFunction, LogLevel::kInfo, "Updating onDeviceAsset for its new location: %@",
-         describeLocation(*coordinate));
+  KX_LOG(kClientSource, kReconcileAssets, LogLevel::kInfo,
+         "Updating onDeviceAsset for its new location: %@", describeLocation(*coordinate));
   device.setLocation(coordinate);
 }
 
@@ -246,12 +248,12 @@ void KXSyncClient::updateFaces(KXManagedAsset& device, const KXSAsset& host) {
     if (!hostFaces.match(*face)) surplus.push_back(face);
   }
   for (const KXManagedFacePtr& face : surplus) {
-    KX_LOG(kSource, kFunction, LogLevel::kInfo, "Deleting face with index: %d",
+    KX_LOG(kClientSource, kReconcileAssets, LogLevel::kInfo, "Deleting face with index: %d",
            static_cast<int>(face->identifier()));
     face->deleteObject();
   }
   hostFaces.forEachUnmatched([&device](const KXSFace& face) {
-    KX_LOG(kSource, kFunction, LogLevel::kInfo, "adding face: %d",
+    KX_LOG(kClientSource, kReconcileAssets, LogLevel::kInfo, "adding face: %d",
            static_cast<int>(face.identifier()));
     device.addFace(face.relativeRect(), HostFaces::identifierOf(face), face.albumUUID());
   });
@@ -266,8 +268,8 @@ void KXSyncClient::updateAlbums(AssetReconciliation& run, std::size_t index, std
     if (album && album->isDeleted()) continue;
     KXManagedAlbum* const managed = album ? album->asManagedAlbum() : nullptr;
     if (managed != nullptr) managed->removeAsset(device);
-    KX_LOG(kSource, kFunction, LogLevel::kInfo, "Asset %@ %@ removed from album %@ %@", device,
-           uuid, album, key);
+    KX_LOG(kClientSource, kReconcileAssets, LogLevel::kInfo, "Asset %@ %@ removed from album %@ %@",
+           device, uuid, album, key);
   }
   for (const Value& key : changes.toJoin) {
     const KXGenericAlbumPtr* found = run.deviceAlbums.find(key.stringValue());
@@ -275,8 +277,8 @@ void KXSyncClient::updateAlbums(AssetReconciliation& run, std::size_t index, std
     if (album && album->isDeleted()) continue;
     KXManagedAlbum* const managed = album ? album->asManagedAlbum() : nullptr;
     if (managed != nullptr) managed->addAssetUsingTesselAlbumOrder(device);
-    KX_LOG(kSource, kFunction, LogLevel::kInfo, "Asset %@ %@ added to album %@ %@", device, uuid,
-           album, key);
+    KX_LOG(kClientSource, kReconcileAssets, LogLevel::kInfo, "Asset %@ %@ added to album %@ %@",
+           device, uuid, album, key);
   }
 }
 

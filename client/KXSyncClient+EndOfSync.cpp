@@ -1,21 +1,16 @@
 #include "client/KXSyncClient.h"
+#include "client/LogSource.h"
 
 namespace kx {
-namespace {
-
-constexpr const char* kSource = "KXSyncClient";
-
-}  // namespace
-
 void KXSyncClient::syncEndedWithSuccess(bool success) {
-  KX_LOG(kSource, "syncEndedWithSuccess", LogLevel::kInfo, "syncEndedWithSuccess %d",
+  KX_LOG(kClientSource, "syncEndedWithSuccess", LogLevel::kInfo, "syncEndedWithSuccess %d",
          success ? 1 : 0);
   _stopListeningToMemoryPressureEvents();
 }
 
 void KXSyncClient::assetTransferEndedWithSuccess(bool success) {
   constexpr const char* kFunction = "assetTransferEndedWithSuccess";
-  KX_LOG(kSource, kFunction, LogLevel::kInfo, "assetTransferEndedWithSuccess: %@",
+  KX_LOG(kClientSource, kFunction, LogLevel::kInfo, "assetTransferEndedWithSuccess: %@",
          success ? "YES" : "NO");
   if (success) {
     const KXSyncSaveJobPtr job = platform_.sharedAssetsSaver().newSyncSaveJob();
@@ -23,14 +18,14 @@ void KXSyncClient::assetTransferEndedWithSuccess(bool success) {
     job->setOriginalAssetURL(kKXSnapshotPath);
     _enqueueSyncSaveJob(job);
   } else {
-    KX_LOG(kSource, kFunction, LogLevel::kDebug,
+    KX_LOG(kClientSource, kFunction, LogLevel::kDebug,
            "========= Photos Sync did not end with success ======");
   }
   _cleanupAfterSyncOrRestoreWithError(nullptr);
 }
 
 void KXSyncClient::_cleanupAfterSyncOrRestoreWithError(const ErrorPtr& /*error*/) {
-  KX_LOG(kSource, "_cleanupAfterSyncOrRestoreWithError", LogLevel::kInfo,
+  KX_LOG(kClientSource, "_cleanupAfterSyncOrRestoreWithError", LogLevel::kInfo,
          "_cleanupAfterSyncOrRestore: _syncRequested=%@", syncRequested_ ? "YES" : "NO");
   const std::shared_ptr<TransferList> outstanding = outstandingAssets();
   const bool nothingOutstanding = !outstanding || outstanding->empty();

@@ -1,12 +1,12 @@
 #include "client/KXSyncClient.h"
+#include "client/LogSource.h"
 #include "platform/foundation/Text.h"
 #include "records/TesselDates.h"
 
 namespace kx {
 namespace {
 
-constexpr const char* kSource = "KXSyncClient";
-constexpr const char* kFunction = "_syncAssetTransfer";
+constexpr const char* kImportFunction = "_syncAssetTransfer";
 constexpr const char* kMediaDirectory = "/var/mobile/Media";
 constexpr double kSaveIntervalSeconds = 3.0;
 
@@ -29,7 +29,7 @@ Value arrayOf(const std::optional<ArrayView>& view) {
 
 void KXSyncClient::_syncAssetTransfer(const FRAssetPtr& request, bool succeeded,
                                       const ErrorPtr& error) {
-  KX_LOG(kSource, kFunction, LogLevel::kInfo,
+  KX_LOG(kClientSource, kImportFunction, LogLevel::kInfo,
          "Sync asset: %@   isAvailableAtPath: %@ success: %@ error: %@", request, request->path(),
          succeeded ? "YES" : "NO", error);
   if (error && !succeeded && !isRecoverableTransferError(*error)) {
@@ -37,33 +37,34 @@ void KXSyncClient::_syncAssetTransfer(const FRAssetPtr& request, bool succeeded,
     return;
   }
   if (!succeeded) {
-    KX_LOG(kSource, kFunction, LogLevel::kError, "Asset transfer was not successful!");
+    KX_LOG(kClientSource, kImportFunction, LogLevel::kError, "Asset transfer was not successful!");
     return;
   }
   const std::shared_ptr<TransferList> outstanding = outstandingAssets();
   if (!outstanding || !outstanding->contains(request)) {
-    KX_LOG(kSource, kFunction, LogLevel::kWarning, "Got transfer notification of unknown asset: %@",
-           request);
+    KX_LOG(kClientSource, kImportFunction, LogLevel::kWarning,
+           "Got transfer notification of unknown asset: %@", request);
     return;
   }
   if (!request->isDownload()) {
-    KX_LOG(kSource, kFunction, LogLevel::kError,
+    KX_LOG(kClientSource, kImportFunction, LogLevel::kError,
            "Asset upload complete--erm...unsupported...how did this happen??");
     return;
   }
   if (!request->path()) {
-    KX_LOG(kSource, kFunction, LogLevel::kError, "Asset with no path: %@, ignoring.", request);
+    KX_LOG(kClientSource, kImportFunction, LogLevel::kError, "Asset with no path: %@, ignoring.",
+           request);
     return;
   }
   const KXSyncSaveJobPtr job = saveJobForRequest(*request);
-  KX_LOG(kSource, kFunction, LogLevel::kDebug, "Adding asset %@", job);
+  KX_LOG(kClientSource, kImportFunction, LogLevel::kDebug, "Adding asset %@", job);
   _enqueueSyncSaveJob(job);
   if (_timeSinceLastSave() >= kSaveIntervalSeconds) _saveOutstandingSyncJobs();
   outstanding->remove(request);
 }
 
 void KXSyncClient::giveUpSyncAsset(const FRAssetPtr& request, const ErrorPtr& error) {
-  KX_LOG(kSource, kFunction, LogLevel::kInfo,
+  KX_LOG(kClientSource, kImportFunction, LogLevel::kInfo,
          "Encountered unrecoverable error %@ for asset %@ during sync", error, request);
   if (const std::shared_ptr<TransferList> outstanding = outstandingAssets()) {
     outstanding->remove(request);

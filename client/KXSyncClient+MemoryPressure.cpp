@@ -3,7 +3,7 @@
 namespace kx {
 namespace {
 
-constexpr const char* kSource = "KXSyncClient+MemoryPressure";
+constexpr const char* kMemoryPressureSource = "KXSyncClient+MemoryPressure";
 
 // Turns every registered object into a fault, so that its memory can be had back; unsaved changes
 // are kept.
@@ -13,7 +13,7 @@ void refaultRegisteredObjects(KXManagedObjectContext& context) {
     context.refreshObject(object, object->hasChanges());
     ++count;
   }
-  KX_LOG(kSource, "_startListeningToMemoryPressureEvents", LogLevel::kDebug,
+  KX_LOG(kMemoryPressureSource, "_startListeningToMemoryPressureEvents", LogLevel::kDebug,
          "Re-faulted %d objects.", count);
 }
 

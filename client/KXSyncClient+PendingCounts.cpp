@@ -1,11 +1,10 @@
 #include <unordered_set>
 
 #include "client/KXSyncClient.h"
+#include "client/LogSource.h"
 
 namespace kx {
 namespace {
-
-constexpr const char* kSource = "KXSyncClient";
 
 bool isAtRest(const KXGenericAlbum& album) {
   return album.pendingItemsType() == kKXPendingItemsNone && album.pendingItemsCount() == 0;
@@ -30,12 +29,13 @@ void setPendingCount(const KXGenericAlbumPtr& album, unsigned count) {
   const auto text = [&album](std::string (KXGenericAlbum::*read)() const) {
     return album ? std::optional<std::string>((*album.*read)()) : std::nullopt;
   };
-  KX_LOG(kSource, kFunction, LogLevel::kInfo,
+  KX_LOG(kClientSource, kFunction, LogLevel::kInfo,
          "Album: %@ (%@,%@) id=%@ pendingItemsCount=%lu CD_ID=%@",
          text(&KXGenericAlbum::localizedTitle), text(&KXGenericAlbum::className),
          text(&KXGenericAlbum::_kindDescription), album ? album->uuid() : OptionalString(),
          album ? album->pendingItemsCount() : 0U, text(&KXGenericAlbum::shortObjectIDURI));
-  KX_LOG(kSource, kFunction, LogLevel::kInfo, "     Setting pendingItemsCount to be %lu", count);
+  KX_LOG(kClientSource, kFunction, LogLevel::kInfo, "     Setting pendingItemsCount to be %lu",
+         count);
   if (!album) return;
   album->setPendingItemsCount(count);
   album->setPendingItemsType(kKXPendingItemsSync);
@@ -111,7 +111,7 @@ void KXSyncClient::_clearPendingCounts() {
   constexpr const char* kFunction = "_clearPendingCounts";
   if (libraryGroup_) libraryGroup_->wait();
   submitTransaction(libraryGroup_, [library = library_, syncRequested = syncRequested_] {
-    KX_LOG(kSource, kFunction, LogLevel::kInfo, "_clearPendingCounts: _syncRequested=%@",
+    KX_LOG(kClientSource, kFunction, LogLevel::kInfo, "_clearPendingCounts: _syncRequested=%@",
            syncRequested ? "YES" : "NO");
     if (syncRequested) {
       for (const auto& entry : onDeviceAlbumsByUUID(*library)) putToRestIfNeeded(entry.value);
@@ -120,25 +120,25 @@ void KXSyncClient::_clearPendingCounts() {
       putToRestIfNeeded(library->shoeboxAlbum());
       putToRestIfNeeded(library->otaRestoreProgressAlbum());
     }
-    KX_LOG(kSource, kFunction, LogLevel::kInfo, "_clearPendingCounts completed");
+    KX_LOG(kClientSource, kFunction, LogLevel::kInfo, "_clearPendingCounts completed");
   });
 }
 
 void KXSyncClient::_clearEmptySyncAlbums() {
   constexpr const char* kFunction = "_clearEmptySyncAlbums";
-  KX_LOG(kSource, kFunction, LogLevel::kInfo, "_clearEmptySyncAlbums");
+  KX_LOG(kClientSource, kFunction, LogLevel::kInfo, "_clearEmptySyncAlbums");
   if (libraryGroup_) libraryGroup_->wait();
   submitTransaction(libraryGroup_, [library = library_] {
     const auto albums = library->managedObjectContext().fetchEmptyAlbums(
         {kKXAlbumKindSyncedAlbum, kKXAlbumKindSyncedEvent}, nullptr);
     if (albums) {
       for (const KXGenericAlbumPtr& album : *albums) {
-        KX_LOG(kSource, kFunction, LogLevel::kInfo, "_clearEmptySyncAlbums deleting empty album %@",
-               album);
+        KX_LOG(kClientSource, kFunction, LogLevel::kInfo,
+               "_clearEmptySyncAlbums deleting empty album %@", album);
         album->deleteObject();
       }
     }
-    KX_LOG(kSource, kFunction, LogLevel::kInfo, "_clearEmptySyncAlbums completed");
+    KX_LOG(kClientSource, kFunction, LogLevel::kInfo, "_clearEmptySyncAlbums completed");
   });
 }
 

@@ -2,14 +2,14 @@
 
 #include <exception>
 
+#include "client/LogSource.h"
 #include "platform/foundation/PropertyList.h"
 #include "transport/KXSTransportDecoder.h"
 
 namespace kx {
 namespace {
 
-constexpr const char* kSource = "KXSyncClient";
-constexpr const char* kFunction = "reconcileSync";
+constexpr const char* kReconcileFunction = "reconcileSync";
 constexpr const char* kFileURLScheme = "file://";
 constexpr std::string_view kLibraryUUID = "libraryUUID";
 constexpr std::string_view kUserAgent = "userAgent";
@@ -30,16 +30,17 @@ bool KXSyncClient::reconcileSync(std::uint32_t syncType, const std::string& newA
                                  const ProgressCallback& /*progressCallback*/, ErrorPtr* error) {
   syncRequested_ = true;
   assertNotOnMainThread();
-  KX_LOG(kSource, kFunction, LogLevel::kInfo, "Reconcile Sync: (type=%d) anchor: %@", syncType,
-         newAnchor);
-  KX_LOG(kSource, kFunction, LogLevel::kInfo, "Library before: %@", library_);
+  KX_LOG(kClientSource, kReconcileFunction, LogLevel::kInfo, "Reconcile Sync: (type=%d) anchor: %@",
+         syncType, newAnchor);
+  KX_LOG(kClientSource, kReconcileFunction, LogLevel::kInfo, "Library before: %@", library_);
   _initializeLibrary();
 
   ErrorPtr decoderError;
   const KXSLibraryChangeSnapshotPtr snapshot = decodeNewSnapshot(error, &decoderError);
-  KX_LOG(kSource, kFunction, LogLevel::kError, "snapshot %@ err: %@", snapshot, decoderError);
+  KX_LOG(kClientSource, kReconcileFunction, LogLevel::kError, "snapshot %@ err: %@", snapshot,
+         decoderError);
   if (decoderError) {
-    KX_LOG(kSource, kFunction, LogLevel::kInfo, "Forwarding error from KXS");
+    KX_LOG(kClientSource, kReconcileFunction, LogLevel::kInfo, "Forwarding error from KXS");
     setError(error, decoderError);
     return false;
   }
@@ -60,7 +61,7 @@ bool KXSyncClient::reconcileSync(std::uint32_t syncType, const std::string& newA
   current.setIfPresent(kLibraryUUID, Value::optionalString(snapshot->libraryUUID()));
   writeDictionary(kKXCurrentLibraryUUIDPath, std::move(current));
   if (isNullSync) {
-    KX_LOG(kSource, kFunction, LogLevel::kDebug,
+    KX_LOG(kClientSource, kReconcileFunction, LogLevel::kDebug,
            "NULL PHOTO SYNC DETECTED - NO RECONCILING NEEDED");
   } else {
     reconcileSnapshot(snapshot, isResync);
@@ -74,8 +75,8 @@ bool KXSyncClient::reconcileSync(std::uint32_t syncType, const std::string& newA
 KXSLibraryChangeSnapshotPtr KXSyncClient::decodeNewSnapshot(ErrorPtr* error,
                                                             ErrorPtr* decoderError) {
   FileSystem& files = platform_.files();
-  KX_LOG(kSource, kFunction, LogLevel::kInfo, "Loading up change snapshot");
-  KX_LOG(kSource, kFunction, LogLevel::kInfo, "Sync url %@",
+  KX_LOG(kClientSource, kReconcileFunction, LogLevel::kInfo, "Loading up change snapshot");
+  KX_LOG(kClientSource, kReconcileFunction, LogLevel::kInfo, "Sync url %@",
          std::string(kFileURLScheme) + kKXSnapshotPath);
   const std::shared_ptr<KXSTransportDecoder> decoder =
       platform_.snapshotDecoder(KXSTransportDecoder::decoder());
@@ -101,7 +102,7 @@ void KXSyncClient::removeSyncUserAgentInfoFile(const std::string& path) {
   if (!platform_.files().fileExists(path)) return;
   ErrorPtr error;
   if (platform_.files().removeItem(path, &error)) return;
-  KX_LOG(kSource, kFunction, LogLevel::kError,
+  KX_LOG(kClientSource, kReconcileFunction, LogLevel::kError,
          "Failed to remove syncUserAgentInfoFile at path %@ err: %@", path, error);
 }
 
@@ -126,7 +127,7 @@ bool KXSyncClient::decideResync(OptionalString previousUUID,
   if (previousUUID) return previousUUID != uuid;
   const Value stored = readDictionary(kKXCurrentLibraryUUIDPath)[kLibraryUUID];
   if (!stored.isNull() && stored == Value::optionalString(uuid)) return false;
-  KX_LOG(kSource, kFunction, LogLevel::kInfo,
+  KX_LOG(kClientSource, kReconcileFunction, LogLevel::kInfo,
          "Forcing resync based on CurrentLibraryUUID.plist: previous %@, snapshot %@", stored,
          uuid);
   return true;
@@ -143,7 +144,7 @@ void KXSyncClient::reconcileSnapshot(const KXSLibraryChangeSnapshotPtr& snapshot
   isResync_ = isResync;
   _reconcileMetadata();
   const std::shared_ptr<TransferList> outstanding = outstandingAssets();
-  KX_LOG(kSource, kFunction, LogLevel::kInfo,
+  KX_LOG(kClientSource, kReconcileFunction, LogLevel::kInfo,
          "Done reconciling! isResync %d, Outstanding assets: %@", isResync_ ? 1 : 0,
          describeTransfers(outstanding));
 }
@@ -162,7 +163,7 @@ void KXSyncClient::_pullOutMasterAlbumFromAlbumsAndEvents() {
 }
 
 void KXSyncClient::_reconcileMetadata() {
-  KX_LOG(kSource, "_reconcileMetadata", LogLevel::kInfo, "Entering reconcileMetadata");
+  KX_LOG(kClientSource, "_reconcileMetadata", LogLevel::kInfo, "Entering reconcileMetadata");
   const auto group = std::make_shared<DispatchGroup>();
   BlockFailure failure;
   submitWatched(failure, [this, &group] {
@@ -171,10 +172,10 @@ void KXSyncClient::_reconcileMetadata() {
     _setPendingAlbumCounts(group);
     _createAlbumUUIDToObjectIDMap(group);
   });
-  KX_LOG(kSource, "_reconcileMetadata", LogLevel::kInfo, "Waiting for reconcile to finish");
+  KX_LOG(kClientSource, "_reconcileMetadata", LogLevel::kInfo, "Waiting for reconcile to finish");
   group->wait();
   failure.rethrow();
-  KX_LOG(kSource, "_reconcileMetadata", LogLevel::kInfo, "Leaving reconcileMetadata!");
+  KX_LOG(kClientSource, "_reconcileMetadata", LogLevel::kInfo, "Leaving reconcileMetadata!");
 }
 
 // Failures are not reported.

@@ -2,14 +2,14 @@
 #include <unordered_set>
 
 #include "client/KXSyncClient.h"
+#include "client/LogSource.h"
 #include "platform/foundation/PropertyList.h"
 #include "platform/foundation/Text.h"
 
 namespace kx {
 namespace {
 
-constexpr const char* kSource = "KXSyncClient";
-constexpr const char* kFunction = "_neededRestoreAssets";
+constexpr const char* kPlanningFunction = "_neededRestoreAssets";
 constexpr std::string_view kHiddenFolderMark = ".MISC";
 // An extension is a dot among the characters at these distances from the end.
 constexpr std::size_t kShortestExtensionUnits = 2;
@@ -60,13 +60,14 @@ void KXSyncClient::planRestore(RestorePlan& plan) {
   std::optional<std::vector<QBFile>> backupList =
       manager->restoreFilesForDomain(kQBShoeboxDomain, &error);
   if (error || !backupList) {
-    KX_LOG(kSource, kFunction, LogLevel::kWarning,
+    KX_LOG(kClientSource, kPlanningFunction, LogLevel::kWarning,
            "Could not retrieve the list of files backed up. Error = %@", error);
     backupList.emplace();
   }
-  KX_LOG(kSource, kFunction, LogLevel::kInfo, "<===----- The list of backedup files is");
+  KX_LOG(kClientSource, kPlanningFunction, LogLevel::kInfo,
+         "<===----- The list of backedup files is");
   for (const QBFile& file : *backupList) {
-    KX_LOG(kSource, kFunction, LogLevel::kInfo, "   %@", file.path);
+    KX_LOG(kClientSource, kPlanningFunction, LogLevel::kInfo, "   %@", file.path);
   }
   _loadRestoreContext();
   plan.incomplete = library_->pathsForAllIncompleteAssets();
@@ -85,18 +86,19 @@ void KXSyncClient::planRestore(RestorePlan& plan) {
     return *a->path() < *b->path();
   });
   plan.requests = std::move(requests);
-  KX_LOG(kSource, kFunction, LogLevel::kInfo, "Paths to restore = %@", describeList(plan.requests));
+  KX_LOG(kClientSource, kPlanningFunction, LogLevel::kInfo, "Paths to restore = %@",
+         describeList(plan.requests));
 }
 
 StringList KXSyncClient::restorePathsForPlan(RestorePlan& plan,
                                              const std::vector<QBFile>& backupList) {
   if (!restoreContext_) return pathsOfFirstRestoreAttempt(plan, backupList);
   if (restoreUsesDatabase()) {
-    KX_LOG(kSource, kFunction, LogLevel::kInfo,
+    KX_LOG(kClientSource, kPlanningFunction, LogLevel::kInfo,
            "Resuming restore with incomplete files from the database");
     return _restorePathsFromIncompletePaths(plan.incomplete);
   }
-  KX_LOG(kSource, kFunction, LogLevel::kInfo,
+  KX_LOG(kClientSource, kPlanningFunction, LogLevel::kInfo,
          "Resuming restore without using the database for the asset list");
   plan.usedBackupList = true;
   return _restorePathsFromBackupList(backupList);
@@ -104,7 +106,7 @@ StringList KXSyncClient::restorePathsForPlan(RestorePlan& plan,
 
 StringList KXSyncClient::pathsOfFirstRestoreAttempt(RestorePlan& plan,
                                                     const std::vector<QBFile>& backupList) {
-  KX_LOG(kSource, kFunction, LogLevel::kInfo, "First time attempting this restore");
+  KX_LOG(kClientSource, kPlanningFunction, LogLevel::kInfo, "First time attempting this restore");
   restoreContext_.emplace();
   StringList databasePaths = _restorePathsFromIncompletePaths(plan.incomplete);
   StringList backupPaths = _restorePathsFromBackupList(backupList);
@@ -118,10 +120,10 @@ StringList KXSyncClient::pathsOfFirstRestoreAttempt(RestorePlan& plan,
     return databasePaths;
   }
   if (hasExtra) {
-    KX_LOG(kSource, kFunction, LogLevel::kInfo,
+    KX_LOG(kClientSource, kPlanningFunction, LogLevel::kInfo,
            "Found assets in the filesystem which are missing from the database");
   }
-  KX_LOG(kSource, kFunction, LogLevel::kInfo,
+  KX_LOG(kClientSource, kPlanningFunction, LogLevel::kInfo,
          "The database can't help us here, consulting the backup list");
   plan.usedBackupList = true;
   _writeRestoreContext();

@@ -1,11 +1,11 @@
 #include "client/KXSyncClient.h"
+#include "client/LogSource.h"
 #include "platform/foundation/Text.h"
 
 namespace kx {
 namespace {
 
-constexpr const char* kSource = "KXSyncClient";
-constexpr const char* kFunction = "_restoreAssetTransfer";
+constexpr const char* kRestoreFunction = "_restoreAssetTransfer";
 
 std::optional<std::string> nameOfStatus(std::int32_t status) {
   switch (status) {
@@ -34,14 +34,14 @@ void forEachPairAt(const KXSyncAssetGroup* group, const std::optional<std::strin
 }  // namespace
 
 void KXSyncClient::restoreEndedWithError(const ErrorPtr& error) {
-  KX_LOG(kSource, "restoreEndedWithError", LogLevel::kInfo,
+  KX_LOG(kClientSource, "restoreEndedWithError", LogLevel::kInfo,
          "Photos restore was cancelled with error: %@", error);
 }
 
 void KXSyncClient::_restoreAssetTransfer(const FRAssetPtr& request, bool succeeded,
                                          const ErrorPtr& error) {
   const std::optional<std::string> path = request->path();
-  KX_LOG(kSource, kFunction, LogLevel::kInfo,
+  KX_LOG(kClientSource, kRestoreFunction, LogLevel::kInfo,
          "restored asset: %@   isAvailableAtPath: %@ success: %@ error: %@", request, path,
          succeeded ? "YES" : "NO", error);
   std::shared_ptr<KXSyncAssetGroup> group;
@@ -53,18 +53,19 @@ void KXSyncClient::_restoreAssetTransfer(const FRAssetPtr& request, bool succeed
   const std::shared_ptr<TransferList> outstanding = outstandingAssets();
   if (succeeded) {
     if (outstanding) outstanding->remove(request);
-    KX_LOG(kSource, kFunction, LogLevel::kInfo, "Setting pair as complete");
+    KX_LOG(kClientSource, kRestoreFunction, LogLevel::kInfo, "Setting pair as complete");
     forEachPairAt(group.get(), path, [](KXSyncFileStatusPair& pair) {
-      KX_LOG(kSource, kFunction, LogLevel::kInfo, "Pair at path %@ is complete", pair.path());
+      KX_LOG(kClientSource, kRestoreFunction, LogLevel::kInfo, "Pair at path %@ is complete",
+             pair.path());
       pair.setStatus(KXSyncFileStatusPair::kComplete);
     });
   } else if (!error) {
-    KX_LOG(kSource, kFunction, LogLevel::kInfo,
+    KX_LOG(kClientSource, kRestoreFunction, LogLevel::kInfo,
            "We got a potentially recoverable error when trying to restore an asset %@", request);
-    KX_LOG(kSource, kFunction, LogLevel::kInfo, "Nothing to do for now.");
+    KX_LOG(kClientSource, kRestoreFunction, LogLevel::kInfo, "Nothing to do for now.");
     return;
   } else if (!isRecoverableTransferError(*error)) {
-    KX_LOG(kSource, kFunction, LogLevel::kInfo,
+    KX_LOG(kClientSource, kRestoreFunction, LogLevel::kInfo,
            "Encountered unrecoverable error for restore asset %@", request);
     if (outstanding) outstanding->remove(request);
     forEachPairAt(group.get(), path, [this](KXSyncFileStatusPair& pair) {
@@ -79,22 +80,22 @@ void KXSyncClient::_restoreAssetTransfer(const FRAssetPtr& request, bool succeed
 // Once every pair of the group is settled, tells the asset daemon. A missing group counts as
 // settled.
 void KXSyncClient::judgeRestoreGroup(const std::shared_ptr<KXSyncAssetGroup>& group) {
-  KX_LOG(kSource, kFunction, LogLevel::kInfo, "Looking at group %@", group);
+  KX_LOG(kClientSource, kRestoreFunction, LogLevel::kInfo, "Looking at group %@", group);
   StringList completed;
   const auto pairs = group ? group->assetPairs() : nullptr;
   if (pairs) {
     completed.reserve(pairs->size());
     for (const std::shared_ptr<KXSyncFileStatusPair>& pair : *pairs) {
       if (pair->status() == KXSyncFileStatusPair::kComplete) completed.push_back(pair->path());
-      KX_LOG(kSource, kFunction, LogLevel::kInfo, "Pair: %@  has status: %@", pair->path(),
-             nameOfStatus(pair->status()));
+      KX_LOG(kClientSource, kRestoreFunction, LogLevel::kInfo, "Pair: %@  has status: %@",
+             pair->path(), nameOfStatus(pair->status()));
       if (pair->status() != KXSyncFileStatusPair::kPending) continue;
-      KX_LOG(kSource, kFunction, LogLevel::kInfo, "Group is pending...");
+      KX_LOG(kClientSource, kRestoreFunction, LogLevel::kInfo, "Group is pending...");
       return;
     }
   }
   const std::optional<std::string> uuid = group ? group->uuid() : std::nullopt;
-  KX_LOG(kSource, kFunction, LogLevel::kInfo, "Group with uuid %@ is complete!", uuid);
+  KX_LOG(kClientSource, kRestoreFunction, LogLevel::kInfo, "Group with uuid %@ is complete!", uuid);
   platform_.porterClient().updateRestoredAssetWithUUID(uuid, completed);
   appendRestoredFiles(completed);
   _writeRestoreContext();

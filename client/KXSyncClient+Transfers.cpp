@@ -2,11 +2,11 @@
 #include <array>
 
 #include "client/KXSyncClient.h"
+#include "client/LogSource.h"
 
 namespace kx {
 namespace {
 
-constexpr const char* kSource = "KXSyncClient";
 // Codes of domain "FRError" after which the daemon may try again.
 constexpr std::array<std::int64_t, 9> kRecoverableCodes = {4, 7, 8, 9, 14, 16, 18, 19, 20};
 
@@ -22,8 +22,8 @@ std::vector<FRAssetPtr> KXSyncClient::outstandingAssetTransfers() {
   if (!outstandingAssets()) _initializeOutstandingAssets();
   const std::shared_ptr<TransferList> list = outstandingAssets();
   _startListeningToMemoryPressureEvents();
-  KX_LOG(kSource, "outstandingAssetTransfers", LogLevel::kInfo, "outstandingAssetTransfers %@",
-         describeTransfers(list));
+  KX_LOG(kClientSource, "outstandingAssetTransfers", LogLevel::kInfo,
+         "outstandingAssetTransfers %@", describeTransfers(list));
   return list ? list->copy() : std::vector<FRAssetPtr>();
 }
 
@@ -34,7 +34,7 @@ void KXSyncClient::_initializeOutstandingAssets() {
 
 void KXSyncClient::assetTransfer(const FRAssetPtr& asset, bool succeeded, const ErrorPtr& error) {
   if (!asset) return;
-  KX_LOG(kSource, "assetTransfer", LogLevel::kInfo,
+  KX_LOG(kClientSource, "assetTransfer", LogLevel::kInfo,
          "asset: %@   isAvailableAtPath: %@ success: %@ error: %@ isRestore: %@", asset,
          asset->path(), succeeded ? "YES" : "NO", error, asset->isRestore() ? "YES" : "NO");
   if (asset->isRestore()) {

@@ -3,13 +3,13 @@
 #include <atomic>
 #include <exception>
 
+#include "client/LogSource.h"
 #include "platform/foundation/Exceptions.h"
 #include "platform/foundation/Text.h"
 
 namespace kx {
 namespace {
 
-constexpr const char* kSource = "KXSyncClient";
 constexpr const char* kAnchor = "1";
 constexpr const char* kRestoreContextFileName = "restoreContext.plist";
 constexpr int kCleanupWaitSeconds = 28800;
@@ -64,18 +64,18 @@ bool KXSyncClient::prepareForSyncWithHostAnchor(const std::string& /*hostAnchor*
                                                 ErrorPtr* /*error*/) {
   constexpr const char* kFunction = "prepareForSyncWithHostAnchor";
   assertNotOnMainThread();
-  KX_LOG(kSource, kFunction, LogLevel::kDebug, "prepareForSyncWithHostAnchor");
+  KX_LOG(kClientSource, kFunction, LogLevel::kDebug, "prepareForSyncWithHostAnchor");
   Clock& clock = platform_.clock();
   const double start = clock.absoluteTime();
   _startListeningToMemoryPressureEvents();
-  KX_LOG(kSource, kFunction, LogLevel::kInfo, "Library before: %@", library_);
+  KX_LOG(kClientSource, kFunction, LogLevel::kInfo, "Library before: %@", library_);
   _initializeLibrary();
 
   const auto wait = std::make_shared<CleanupWait>();
   const Date cutoff{clock.now().secondsSinceReference - kCleanupMarginSeconds};
   _enqueueRemoteSyncCleanupJobBeforeDate(cutoff, [wait](const ErrorPtr& error) {
     if (error) {
-      KX_LOG(kSource, kFunction, LogLevel::kError,
+      KX_LOG(kClientSource, kFunction, LogLevel::kError,
              "prepareForSyncWithHostAnchor - error waiting for cleanup in quarryd: %@", error);
       wait->succeeded = false;
     }
@@ -83,21 +83,21 @@ bool KXSyncClient::prepareForSyncWithHostAnchor(const std::string& /*hostAnchor*
   });
   _saveOutstandingSyncJobs();
   if (!clock.wait(wait->done, kCleanupWaitSeconds)) {
-    KX_LOG(kSource, kFunction, LogLevel::kError,
+    KX_LOG(kClientSource, kFunction, LogLevel::kError,
            "prepareForSyncWithHostAnchor - timed out after waiting %d seconds for sync cleanup in "
            "quarryd",
            kCleanupWaitSeconds);
     wait->succeeded = false;
   }
-  KX_LOG(kSource, kFunction, LogLevel::kDebug,
+  KX_LOG(kClientSource, kFunction, LogLevel::kDebug,
          "prepareForSyncWithHostAnchor - finished in %f seconds", clock.absoluteTime() - start);
   return wait->succeeded;
 }
 
 void KXSyncClient::_initializeLibrary() {
-  KX_LOG(kSource, "_initializeLibrary", LogLevel::kInfo, "Initializing library");
+  KX_LOG(kClientSource, "_initializeLibrary", LogLevel::kInfo, "Initializing library");
   if (library_) {
-    KX_LOG(kSource, "_initializeLibrary", LogLevel::kDebug, "_library is nonnil");
+    KX_LOG(kClientSource, "_initializeLibrary", LogLevel::kDebug, "_library is nonnil");
   } else {
     library_ = platform_.photoLibrary().newPhotoLibrary();
   }
@@ -105,17 +105,17 @@ void KXSyncClient::_initializeLibrary() {
 }
 
 void KXSyncClient::_uninitializeLibrary() {
-  KX_LOG(kSource, "_uninitializeLibrary", LogLevel::kInfo, "Uninitializing library");
+  KX_LOG(kClientSource, "_uninitializeLibrary", LogLevel::kInfo, "Uninitializing library");
   if (libraryGroup_) {
     libraryGroup_->wait();
     libraryGroup_ = nullptr;
   }
   library_ = nullptr;
-  KX_LOG(kSource, "_uninitializeLibrary", LogLevel::kInfo, "Done uninitializing library.");
+  KX_LOG(kClientSource, "_uninitializeLibrary", LogLevel::kInfo, "Done uninitializing library.");
 }
 
 void KXSyncClient::_clearSyncState() {
-  KX_LOG(kSource, "_clearSyncState", LogLevel::kInfo, "Clearing sync state");
+  KX_LOG(kClientSource, "_clearSyncState", LogLevel::kInfo, "Clearing sync state");
   _stopListeningToMemoryPressureEvents();
   setAlbumsAndEvents(nullptr);
   uuidToKXSAsset_ = nullptr;
@@ -172,7 +172,7 @@ void KXSyncClient::_enqueueSyncSaveJob(const KXSyncSaveJobPtr& job) {
 
 void KXSyncClient::_enqueueRemoteSyncCleanupJobBeforeDate(std::optional<Date> date,
                                                           FinishedBlock finished) {
-  KX_LOG(kSource, "_enqueueRemoteSyncCleanupJobBeforeDate", LogLevel::kInfo,
+  KX_LOG(kClientSource, "_enqueueRemoteSyncCleanupJobBeforeDate", LogLevel::kInfo,
          "_enqueueRemoteSyncCleanupJob");
   const KXSyncSaveJobPtr job = platform_.sharedAssetsSaver().newSyncSaveJob();
   job->setCleanupSyncState(true);
@@ -201,12 +201,12 @@ void KXSyncClient::_saveOutstandingSyncJobs() {
   // The completion may come when this client is gone: it holds all that it needs.
   const DispatchGroupPtr group = libraryGroup_;
   if (group) group->enter();
-  KX_LOG(kSource, kFunction, LogLevel::kInfo,
+  KX_LOG(kClientSource, kFunction, LogLevel::kInfo,
          "_saveOutstandingSyncJobs: about to call saveSyncedAssets");
   platform_.sharedAssetsSaver().saveSyncedAssets(
       std::move(serialized),
       [group, jobs = std::move(jobs)](std::size_t /*imported*/, const ErrorPtr& outcome) {
-        KX_LOG(kSource, kFunction, LogLevel::kInfo,
+        KX_LOG(kClientSource, kFunction, LogLevel::kInfo,
                "_saveOutstandingSyncJobs: completed call to saveSyncedAssets");
         if (group) group->leave();
         for (const KXSyncSaveJobPtr& job : jobs) {
