@@ -120,20 +120,32 @@ bool BackupFolder::holds(const std::string& path, const BackupFile& file) const 
 }
 
 ErrorPtr BackupFolder::checkVacant(const std::string& path) const {
-  for (std::size_t slash = path.find('/', 1);; slash = path.find('/', slash + 1)) {
+  std::size_t slash = 0;
+  while (slash != std::string::npos) {
+    slash = path.find('/', slash + 1);
     const std::string part = path.substr(0, slash);
     struct stat status;
     const int failed = root_->status(part, &status);
     if (failed == ENOENT) return nullptr;
     if (failed != 0) return failure("cannot examine", part, failed);
-    const bool isLast = slash == std::string::npos;
     if (previous_ && namesFile(*previous_, part)) return nullptr;  // goes away or is replaced
-    if (isLast || !S_ISDIR(status.st_mode)) {
-      return backupError(
-          BackupError::kNotOurs,
-          root_->hostPath() + part + " is no part of the backup and in its way: move it elsewhere");
-    }
+    if (!S_ISDIR(status.st_mode)) return inTheWay(part);
   }
+  // A directory has the name: its files have to be the backup's.
+  ErrorPtr wrong;
+  const int failed = walkTree(*root_, path, [&](const std::string& inside, bool isDirectory) {
+    if (isDirectory || (previous_ && namesFile(*previous_, inside))) return 0;
+    wrong = inTheWay(inside);
+    return EEXIST;
+  });
+  if (wrong || failed == 0) return wrong;
+  return failure("cannot examine", path, failed);
+}
+
+ErrorPtr BackupFolder::inTheWay(const std::string& path) const {
+  return backupError(
+      BackupError::kNotOurs,
+      root_->hostPath() + path + " is no part of the backup and in its way: move it elsewhere");
 }
 
 ErrorPtr BackupFolder::begin(const std::function<bool(const BackupFile&)>& wanted,
@@ -275,6 +287,7 @@ int BackupFolder::moveOne(const std::string& path) {
   }
   if (const int failed = root_->openFile(directory, kFlags, &toParent); failed != 0) return failed;
   const std::string leaf(lastPathComponent(path));
+  if (const int failed = removeEmptyDirectories(path); failed != 0) return failed;
   // Nothing that is not the backup's own is replaced.
   const bool replaces = path == kManifest || (previous_ && namesFile(*previous_, path));
   if (::renameat2(fromParent.get(), leaf.c_str(), toParent.get(), leaf.c_str(),
@@ -284,6 +297,16 @@ int BackupFolder::moveOne(const std::string& path) {
   touched_.insert(directory);
   touched_.insert(parentOf(from));
   return 0;
+}
+
+// What files of the old backup have left in the place of a file of the new one.
+int BackupFolder::removeEmptyDirectories(const std::string& path) {
+  struct stat status;
+  if (root_->status(path, &status) != 0 || !S_ISDIR(status.st_mode)) return 0;
+  const int failed = walkTree(*root_, path, [&](const std::string& inside, bool isDirectory) {
+    return isDirectory ? root_->remove(inside) : EEXIST;
+  });
+  return failed != 0 ? failed : root_->remove(path);
 }
 
 int BackupFolder::syncTouched() {

@@ -30,7 +30,7 @@ class BackupFolder {
   const BackupManifest* previous() const { return previous_ ? &*previous_ : nullptr; }
   // Whether there is a regular file of that size and time at a path.
   bool holds(const std::string& path, const BackupFile& file) const;
-  // Null when a file that is no part of the backup yet may be put at the path, else what is wrong.
+  // Null when a file may be put at the path: nothing but files of the backup is in its way.
   ErrorPtr checkVacant(const std::string& path) const;
 
   // Makes .incoming, or takes over what a taking that was cut off has copied: those of its files
@@ -50,6 +50,7 @@ class BackupFolder {
  private:
   BackupFolder(std::shared_ptr<DeviceRoot> root, UniqueFd lock)
       : root_(std::move(root)), lock_(std::move(lock)) {}
+  ErrorPtr inTheWay(const std::string& path) const;
   ErrorPtr load();
   ErrorPtr checkOurs();
   [[nodiscard]] int syncAll() const;
@@ -58,6 +59,7 @@ class BackupFolder {
   [[nodiscard]] int removeOne(const std::string& path);
   [[nodiscard]] int moveAll(const BackupManifest& manifest, std::string* conflict);
   [[nodiscard]] int moveOne(const std::string& path);
+  [[nodiscard]] int removeEmptyDirectories(const std::string& path);
   [[nodiscard]] int syncTouched();
   [[nodiscard]] int clearIncoming(const std::set<std::string, std::less<>>& kept);
   ErrorPtr failure(const std::string& what, const std::string& path, int errorNumber) const;

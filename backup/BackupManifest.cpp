@@ -32,7 +32,7 @@ constexpr const char* kListNames[] = {"albums", "events", "faceAlbums"};
 class Refusal : public std::runtime_error {
  public:
   explicit Refusal(const std::string& why, BackupError error = BackupError::kUnusable)
-      : std::runtime_error(why), code(error) {}
+      : std::runtime_error(escapeControlCharacters(why)), code(error) {}
   const BackupError code;
 };
 

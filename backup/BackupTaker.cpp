@@ -181,7 +181,7 @@ void Taking::planOne(const BackupCandidate& candidate) {
     manifest_.files.push_back(*old);
     return;
   }
-  if (old == nullptr) endWith(folder_->checkVacant(path));
+  endWith(folder_->checkVacant(path));
   toCopy_.push_back(candidate);
 }
 

@@ -8,6 +8,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <functional>
 
 #include "device/DeviceErrors.h"
 #include "platform/foundation/Text.h"
@@ -27,27 +28,34 @@ class HeldLock : public FileLock {
   UniqueFd fd_;
 };
 
+// A directory on the way of a walk, held open.
 struct Level {
-  std::string path;
-  std::string identifier;
+  std::unique_ptr<DIR, int (*)(DIR*)> stream{nullptr, &::closedir};
+  FileProperties entry;            // what its entries have in common, and the entry in hand
   std::vector<std::string> names;  // sorted from the end, so that the next one is the last
 };
 
-// One directory of a walk; null when it cannot be listed.
-std::unique_ptr<Level> openLevel(const DeviceRoot& root, const std::string& path,
-                                 const FileSystem::ErrorHandler& onError) {
-  auto level = std::make_unique<Level>();
-  level->path = path;
-  struct stat status;
-  int failed = root.status(path, &status);
-  if (failed == 0) failed = root.list(path, &level->names);
-  if (failed != 0) {
-    onError(path, posixError(path, failed));
-    return nullptr;
+int openLevel(const DeviceRoot& root, const std::string& path, Level* level) {
+  UniqueFd fd;
+  if (const int failed = root.openFile(path, O_RDONLY | O_DIRECTORY, &fd); failed != 0) {
+    return failed;
   }
-  level->identifier = identifierOf(status);
-  std::reverse(level->names.begin(), level->names.end());
-  return level;
+  struct stat status;
+  if (::fstat(fd.get(), &status) != 0) return errno;
+  level->stream.reset(::fdopendir(fd.get()));
+  if (!level->stream) return errno;
+  fd.release();  // the stream closes it
+  errno = 0;
+  while (const dirent* found = ::readdir(level->stream.get())) {
+    const std::string_view name = found->d_name;
+    if (name != "." && name != "..") level->names.emplace_back(name);
+    errno = 0;
+  }
+  if (errno != 0) return errno;
+  std::sort(level->names.begin(), level->names.end(), std::greater<>());
+  level->entry.parentPath = path;
+  level->entry.parentResourceIdentifier = identifierOf(status);
+  return 0;
 }
 
 }  // namespace
@@ -93,30 +101,44 @@ std::vector<std::string> DeviceFileSystem::contentsOfDirectory(const std::string
 
 void DeviceFileSystem::enumerate(const std::string& path, const EntryHandler& onEntry,
                                  const ErrorHandler& onError) {
-  std::vector<std::unique_ptr<Level>> levels;
-  if (auto top = openLevel(*root_, path, onError)) levels.push_back(std::move(top));
+  std::vector<Level> levels;
+  const auto descend = [&](const std::string& directory) {
+    Level level;
+    if (const int failed = openLevel(*root_, directory, &level); failed != 0) {
+      onError(directory, posixError(directory, failed));
+    } else {
+      levels.push_back(std::move(level));
+    }
+  };
+  descend(path);
   while (!levels.empty()) {
-    Level& level = *levels.back();
+    Level& level = levels.back();
     if (level.names.empty()) {
       levels.pop_back();
       continue;
     }
-    FileProperties entry;
+    FileProperties& entry = level.entry;
     entry.name = std::move(level.names.back());
     level.names.pop_back();
-    entry.path = pathByAppending(level.path, entry.name);
-    entry.parentPath = level.path;
-    entry.parentResourceIdentifier = level.identifier;
+    entry.path.assign(entry.parentPath);
+    if (entry.path.back() != '/') entry.path += '/';
+    entry.path += entry.name;
     struct stat status;
-    if (const int failed = root_->status(entry.path, &status); failed != 0) {
-      entry.error = posixError(entry.path, failed);
-    } else {
-      entry.fileSize = status.st_size;
-      entry.isDirectory = S_ISDIR(status.st_mode);
+    const bool found = ::fstatat(::dirfd(level.stream.get()), entry.name.c_str(), &status,
+                                 AT_SYMLINK_NOFOLLOW) == 0;
+    const int failed = found ? 0 : errno;
+    if (failed == ENOENT) {
+      onError(entry.path, posixError(entry.path, failed));
+      continue;
     }
+    entry.error = found ? nullptr : posixError(entry.path, failed);
+    entry.fileSize = found ? status.st_size : 0;
+    entry.isDirectory = found && S_ISDIR(status.st_mode);
     const EnumerationChoice choice = onEntry(entry);
-    if (!entry.isDirectory || choice == EnumerationChoice::kSkipDescendants) continue;
-    if (auto next = openLevel(*root_, entry.path, onError)) levels.push_back(std::move(next));
+    if (entry.isDirectory && choice == EnumerationChoice::kDescend) {
+      const std::string directory = entry.path;  // the levels move
+      descend(directory);
+    }
   }
 }
 
