@@ -74,16 +74,12 @@ bool KXSyncClient::reconcileSync(std::uint32_t syncType, const std::string& newA
 // could be decoded; the reader's error goes to `error`.
 KXSLibraryChangeSnapshotPtr KXSyncClient::decodeNewSnapshot(ErrorPtr* error,
                                                             ErrorPtr* decoderError) {
-  FileSystem& files = platform_.files();
   KX_LOG(kClientSource, kReconcileFunction, LogLevel::kInfo, "Loading up change snapshot");
   KX_LOG(kClientSource, kReconcileFunction, LogLevel::kInfo, "Sync url %@",
          std::string(kFileURLScheme) + kKXSnapshotPath);
   const std::shared_ptr<KXSTransportDecoder> decoder =
       platform_.snapshotDecoder(KXSTransportDecoder::decoder());
-  Value root;
-  if (const DataPtr bytes = files.readFile(kKXSnapshotPath, error)) {
-    root = readPropertyList(bytes, error);
-  }
+  const Value root = readPropertyListFile(platform_.files(), kKXSnapshotPath, error);
   const std::string agentPath = platform_.photoLibrary().syncInfoPath();
   removeSyncUserAgentInfoFile(agentPath);
   if (!root.isDictionary()) return nullptr;
@@ -187,9 +183,7 @@ void KXSyncClient::writeDictionary(const std::string& path, Dictionary dictionar
 
 // Null when the file is missing, unreadable or holds no dictionary.
 Value KXSyncClient::readDictionary(const std::string& path) {
-  const DataPtr bytes = platform_.files().readFile(path, nullptr);
-  if (!bytes) return Value();
-  const Value root = readPropertyList(bytes, nullptr);
+  const Value root = readPropertyListFile(platform_.files(), path, nullptr);
   return root.isDictionary() ? root : Value();
 }
 

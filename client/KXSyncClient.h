@@ -16,15 +16,11 @@
 #include "platform/Platform.h"
 #include "platform/foundation/OrderedMap.h"
 #include "platform/sync/FRClient.h"
+#include "platform/sync/SyncPaths.h"
 #include "transport/KXSLibraryChangeSnapshot.h"
 
 namespace kx {
 
-inline constexpr const char* kKXSnapshotPath = "/var/mobile/Media/Photos/Sync/PhotoLibrary.plist";
-inline constexpr const char* KXPreviousMetadataSyncFilePath =
-    "/var/mobile/Media/Photos/Sync/PhotoLibrary.plist.lastsynced";
-inline constexpr const char* kKXCurrentLibraryUUIDPath =
-    "/var/mobile/Media/Photos/Sync/CurrentLibraryUUID.plist";
 inline constexpr const char* kKXSyncRestoreContextRestoredFilesKey =
     "kKXSyncRestoreContextRestoredFilesKey";
 inline constexpr const char* kKXSyncRestoreContextUseDatabaseKey =

@@ -19,12 +19,12 @@ Value readDevicePropertyList(FileSystem& files, const std::string& path) {
 }
 
 ErrorPtr LibrarySwitch::begin(const std::string& newLibraryUUID) {
-  const Value current = readDevicePropertyList(files_, kCurrentLibraryPath)["libraryUUID"];
+  const Value current = readDevicePropertyList(files_, kKXCurrentLibraryUUIDPath)["libraryUUID"];
   if (current.isString() && current.stringValue() == newLibraryUUID) return nullptr;
   Dictionary marker;
   ErrorPtr error;
-  if (files_.fileExists(kCurrentLibraryPath)) {
-    const DataPtr content = files_.readFile(kCurrentLibraryPath, &error);
+  if (files_.fileExists(kKXCurrentLibraryUUIDPath)) {
+    const DataPtr content = files_.readFile(kKXCurrentLibraryUUIDPath, &error);
     if (!content) return error;
     marker.set(kContentKey, Value::data(content->span()));
   }
@@ -49,9 +49,9 @@ ErrorPtr LibrarySwitch::rollBack() {
   if (marker.isDictionary()) {
     const Value content = marker[kContentKey];
     if (content.kind() == Kind::kData) {
-      files_.writeFileAtomically(kCurrentLibraryPath, content.dataValue(), &error);
-    } else if (files_.fileExists(kCurrentLibraryPath)) {
-      files_.removeItem(kCurrentLibraryPath, &error);
+      files_.writeFileAtomically(kKXCurrentLibraryUUIDPath, content.dataValue(), &error);
+    } else if (files_.fileExists(kKXCurrentLibraryUUIDPath)) {
+      files_.removeItem(kKXCurrentLibraryUUIDPath, &error);
     }
   }
   if (!error) files_.removeItem(kLibraryMarkerPath, &error);

@@ -4,16 +4,12 @@
 
 #include "platform/foundation/Error.h"
 #include "platform/foundation/Value.h"
+#include "platform/sync/SyncPaths.h"
 
 namespace kx {
 
 class FileSystem;
 
-inline constexpr const char* kSnapshotPath = "/var/mobile/Media/Photos/Sync/PhotoLibrary.plist";
-inline constexpr const char* kLastSyncedPath =
-    "/var/mobile/Media/Photos/Sync/PhotoLibrary.plist.lastsynced";
-inline constexpr const char* kCurrentLibraryPath =
-    "/var/mobile/Media/Photos/Sync/CurrentLibraryUUID.plist";
 // Holds what the current library file was before a reconcile for another library.
 inline constexpr const char* kLibraryMarkerPath =
     "/var/mobile/Media/Photos/Sync/.CurrentLibraryUUID.before";

@@ -90,9 +90,9 @@ ErrorPtr SyncSession::checkAgainstDevice() {
 
 // Whether the host's snapshot is, byte for byte, the one that the device sealed last.
 bool SyncSession::matchesSeal() {
-  if (!files_.fileExists(kLastSyncedPath)) return false;
+  if (!files_.fileExists(KXPreviousMetadataSyncFilePath)) return false;
   ErrorPtr ignored;
-  const DataPtr last = files_.readFile(kLastSyncedPath, &ignored);
+  const DataPtr last = files_.readFile(KXPreviousMetadataSyncFilePath, &ignored);
   return last && last->isEqualToData(*snapshot_.bytes);
 }
 
@@ -122,7 +122,7 @@ bool SyncSession::putSnapshotInPlace() {
   if (!error) staging_ = Staging::open(context_.options.deviceRoot, &error);
   if (staging_) staging_->clear();
   // A file that holds these bytes already is left as it is.
-  if (!error) files_.writeFileAtomically(kSnapshotPath, snapshot_.bytes->span(), &error);
+  if (!error) files_.writeFileAtomically(kKXSnapshotPath, snapshot_.bytes->span(), &error);
   if (error) fail(prefixed("the snapshot cannot be put on the device", *error));
   return error == nullptr;
 }
@@ -157,7 +157,7 @@ bool SyncSession::callPrepare() {
 bool SyncSession::reconcile() {
   enter(SyncPhase::kReconciling);
   const bool isResync = predictResync();
-  const bool hadLastSynced = files_.fileExists(kLastSyncedPath);
+  const bool hadLastSynced = files_.fileExists(KXPreviousMetadataSyncFilePath);
   if (const ErrorPtr error = librarySwitch_.begin(snapshot_.checked.libraryUUID)) {
     fail(prefixed("the name of the library before cannot be kept", *error));
     endWithoutTransfers();
@@ -173,7 +173,7 @@ bool SyncSession::reconcile() {
   }
   result_.resync = isResync;
   // Every reconcile but a null one takes the last-synced snapshot away.
-  isNull_ = hadLastSynced && files_.fileExists(kLastSyncedPath);
+  isNull_ = hadLastSynced && files_.fileExists(KXPreviousMetadataSyncFilePath);
   return true;
 }
 
@@ -196,9 +196,9 @@ void SyncSession::settleLibrarySwitch(bool reconciled) {
 // By the rules of the reconcile, over the same files, before it changes them.
 bool SyncSession::predictResync() {
   if (matchesSeal()) return false;
-  Value known = readDevicePropertyList(files_, kLastSyncedPath)["libraryUUID"];
+  Value known = readDevicePropertyList(files_, KXPreviousMetadataSyncFilePath)["libraryUUID"];
   if (!known.isString()) {
-    known = readDevicePropertyList(files_, kCurrentLibraryPath)["libraryUUID"];
+    known = readDevicePropertyList(files_, kKXCurrentLibraryUUIDPath)["libraryUUID"];
   }
   return !known.isString() || known.stringValue() != snapshot_.checked.libraryUUID;
 }
@@ -324,7 +324,7 @@ void SyncSession::judge() {
                   std::to_string(count) + (count == 1 ? " photo" : " photos") + " did not make it");
     return;
   }
-  if (!files_.fileExists(kLastSyncedPath)) {
+  if (!files_.fileExists(KXPreviousMetadataSyncFilePath)) {
     fail(syncError(SyncErrorCode::kNotSealed,
                    "everything arrived, but the device could not prove that it holds it"));
     return;

@@ -1,5 +1,7 @@
 #pragma once
 
+#include "platform/sync/SyncPaths.h"
+
 // Where things lie on the device: absolute device paths without a trailing slash.
 namespace kx::device_paths {
 
@@ -21,11 +23,9 @@ inline constexpr const char* kRestoreContext =
 // There while a restore from backup is under way, with the backup's identity.
 inline constexpr const char* kRestoreMarker = "/var/mobile/Media/PhotoData/RestoreMarker.plist";
 inline constexpr const char* kSync = "/var/mobile/Media/Photos/Sync";
-inline constexpr const char* kSnapshot = "/var/mobile/Media/Photos/Sync/PhotoLibrary.plist";
-inline constexpr const char* kLastSynced =
-    "/var/mobile/Media/Photos/Sync/PhotoLibrary.plist.lastsynced";
-inline constexpr const char* kCurrentLibraryUUID =
-    "/var/mobile/Media/Photos/Sync/CurrentLibraryUUID.plist";
+inline constexpr const char* kSnapshot = kKXSnapshotPath;
+inline constexpr const char* kLastSynced = KXPreviousMetadataSyncFilePath;
+inline constexpr const char* kCurrentLibraryUUID = kKXCurrentLibraryUUIDPath;
 // Transferred files until quarryd takes them; on the same file system as kSyncedAssets.
 inline constexpr const char* kStaging = "/var/mobile/Media/Photos/Sync/Staging";
 inline constexpr const char* kTemporary = "/tmp";

@@ -147,18 +147,18 @@ ErrorPtr readFailure(const ErrorPtr& cause) {
 
 }  // namespace
 
+Value readPropertyListFile(FileSystem& files, const std::string& path, ErrorPtr* error) {
+  ErrorPtr cause;
+  DataPtr bytes = files.readFile(path, &cause);
+  if (bytes) return readPropertyList(std::move(bytes), error);
+  setError(error, readFailure(cause));
+  return Value();
+}
+
 KXSLibraryChangeSnapshotPtr KXSTransportDecoder::decodeSnapshotFromFile(FileSystem& files,
                                                                         const std::string& path,
                                                                         ErrorPtr* error) {
-  ErrorPtr cause;
-  Value root;
-  DataPtr bytes = files.readFile(path, &cause);
-  if (bytes) {
-    root = readPropertyList(std::move(bytes), error);
-  } else {
-    setError(error, readFailure(cause));
-  }
-  return decodeSnapshotFromPropertyList(root, error);
+  return decodeSnapshotFromPropertyList(readPropertyListFile(files, path, error), error);
 }
 
 KXSLibraryChangeSnapshotPtr KXSTransportDecoder::decodeSnapshotFromPropertyList(

@@ -21,6 +21,10 @@ class UnknownObjectType : public InternalInconsistency {
   int line() const { return 137; }
 };
 
+// The property list in a device file; null and the reader's error when there is none. A file that
+// cannot be read is PropertyListError::kIo.
+Value readPropertyListFile(FileSystem& files, const std::string& path, ErrorPtr* error);
+
 // Reads snapshot files. No state; any thread. Results are never null: an unreadable file gives a
 // snapshot without identifier and kind, and the reader's error. Raises InternalInconsistency for an
 // item of unknown type or without identifier, TypeError for an item list or item of another type.

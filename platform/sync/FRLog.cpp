@@ -1,5 +1,6 @@
 #include "platform/sync/FRLog.h"
 
+#include <algorithm>
 #include <cstdio>
 #include <mutex>
 
@@ -26,21 +27,23 @@ void appendHexEscape(std::string& out, char c) {
   out += buffer;
 }
 
-// Cuts at the limit without splitting a character and escapes what could steer a terminal.
-std::string finished(std::string text) {
-  if (text.size() > limits::kLogLineBytes) {
-    std::size_t end = limits::kLogLineBytes;
-    while (end > 0 && (static_cast<unsigned char>(text[end]) & 0xC0U) == 0x80U) --end;
-    text.resize(end);
-  }
+// Escapes what could steer a terminal, and cuts at the limit without splitting a character or an
+// escape.
+std::string finished(std::string_view text) {
   std::string out;
-  out.reserve(text.size());
+  out.reserve(std::min<std::size_t>(text.size(), limits::kLogLineBytes));
+  std::size_t whole = 0;  // length of `out` up to its last whole character
   for (const char c : text) {
     const auto byte = static_cast<unsigned char>(c);
+    if ((byte & 0xC0U) != 0x80U) whole = out.size();
     if ((byte < 0x20 && c != '\n') || byte == 0x7F) {
       appendHexEscape(out, c);
     } else {
       out += c;
+    }
+    if (out.size() > limits::kLogLineBytes) {
+      out.resize(whole);
+      break;
     }
   }
   return out;

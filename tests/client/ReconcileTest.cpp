@@ -174,7 +174,8 @@ TEST_F(ReconcileTest, AMissingSnapshotGivesTheReadersError) {
   ErrorPtr error;
   EXPECT_FALSE(client->reconcileSync(1, "1", {}, &error));
   ASSERT_NE(error, nullptr);
-  EXPECT_EQ(error->domain(), kPosixErrorDomain);
+  EXPECT_EQ(error->domain(), kPropertyListErrorDomain);
+  EXPECT_EQ(error->code(), static_cast<std::int64_t>(PropertyListError::kIo));
   EXPECT_TRUE(client->syncRequested());
   EXPECT_FALSE(platform.memoryFiles.fileExists(agentPath()));
   EXPECT_EQ(platform.memoryFiles.text(kKXCurrentLibraryUUIDPath), before);

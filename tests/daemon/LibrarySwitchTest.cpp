@@ -14,10 +14,10 @@ class LibrarySwitchTest : public testing::Test {
   void setCurrent(const std::string& uuid) {
     const DataPtr bytes =
         plistBytes(Value::dictionary(Dictionary{{"libraryUUID", Value::string(uuid)}}));
-    files.writeFileAtomically(kCurrentLibraryPath, bytes->span(), nullptr);
+    files.writeFileAtomically(kKXCurrentLibraryUUIDPath, bytes->span(), nullptr);
   }
   std::string current() {
-    const Value uuid = readDevicePropertyList(files, kCurrentLibraryPath)["libraryUUID"];
+    const Value uuid = readDevicePropertyList(files, kKXCurrentLibraryUUIDPath)["libraryUUID"];
     return uuid.isString() ? std::string(uuid.stringValue()) : "none";
   }
 
@@ -37,7 +37,7 @@ TEST_F(LibrarySwitchTest, PutsTheAbsenceOfANameBack) {
   EXPECT_FALSE(LibrarySwitch(files).begin("new"));
   setCurrent("new");
   EXPECT_FALSE(LibrarySwitch(files).rollBack());
-  EXPECT_FALSE(files.fileExists(kCurrentLibraryPath));
+  EXPECT_FALSE(files.fileExists(kKXCurrentLibraryUUIDPath));
   EXPECT_FALSE(files.fileExists(kLibraryMarkerPath));
 }
 
@@ -61,11 +61,11 @@ TEST_F(LibrarySwitchTest, WritesNothingForTheSameLibrary) {
 }
 
 TEST_F(LibrarySwitchTest, KeepsAnOldFileThatIsNoPropertyListByteForByte) {
-  files.putText(kCurrentLibraryPath, "junk");
+  files.putText(kKXCurrentLibraryUUIDPath, "junk");
   EXPECT_FALSE(LibrarySwitch(files).begin("new"));
   setCurrent("new");
   EXPECT_FALSE(LibrarySwitch(files).rollBack());
-  EXPECT_EQ(files.text(kCurrentLibraryPath), "junk");
+  EXPECT_EQ(files.text(kKXCurrentLibraryUUIDPath), "junk");
 }
 
 TEST_F(LibrarySwitchTest, DropsAMarkerThatCannotBeRead) {

@@ -31,7 +31,7 @@ class SyncRunnerTest : public testing::Test {
     useScript(&script);
     host({"A", "B"});
     // What a whole sync leaves behind.
-    device.memory.memoryFiles.putText(kLastSyncedPath, "sealed");
+    device.memory.memoryFiles.putText(KXPreviousMetadataSyncFilePath, "sealed");
   }
   // A host that lists these assets and has their files.
   void host(const std::vector<std::string>& uuids) {
@@ -57,17 +57,18 @@ class SyncRunnerTest : public testing::Test {
   void expectUntouched(const std::string& before) {
     EXPECT_THAT(script.calls, testing::AnyOf(IsEmpty(), ElementsAre("destroy")));
     EXPECT_EQ(work.fingerprint("device"), before);
-    EXPECT_THAT(device.memory.memoryFiles.files(), ElementsAre(kLastSyncedPath));
+    EXPECT_THAT(device.memory.memoryFiles.files(), ElementsAre(KXPreviousMetadataSyncFilePath));
   }
   std::string currentLibrary() {
     const Value uuid =
-        readDevicePropertyList(device.memory.memoryFiles, kCurrentLibraryPath)["libraryUUID"];
+        readDevicePropertyList(device.memory.memoryFiles, kKXCurrentLibraryUUIDPath)["libraryUUID"];
     return uuid.isString() ? std::string(uuid.stringValue()) : "none";
   }
   void nameLibrary(const std::string& uuid) {
     const DataPtr bytes =
         plistBytes(Value::dictionary(Dictionary{{"libraryUUID", Value::string(uuid)}}));
-    device.memory.memoryFiles.writeFileAtomically(kCurrentLibraryPath, bytes->span(), nullptr);
+    device.memory.memoryFiles.writeFileAtomically(kKXCurrentLibraryUUIDPath, bytes->span(),
+                                                  nullptr);
   }
 
   TempDirectory work;
@@ -203,7 +204,9 @@ TEST_F(SyncRunnerTest, RestoreRequestsCountNeitherForTheFlagNorTheResult) {
 }
 
 TEST_F(SyncRunnerTest, ASyncThatTheDeviceDidNotSealIsNoSuccess) {
-  script.duringReconcile = [&] { device.memory.memoryFiles.removeItem(kLastSyncedPath, nullptr); };
+  script.duringReconcile = [&] {
+    device.memory.memoryFiles.removeItem(KXPreviousMetadataSyncFilePath, nullptr);
+  };
   const SyncResult result = run();
   EXPECT_EQ(result.outcome, SyncOutcome::kFailed);
   EXPECT_EQ(result.error->code(), static_cast<std::int64_t>(SyncErrorCode::kNotSealed));
@@ -211,10 +214,12 @@ TEST_F(SyncRunnerTest, ASyncThatTheDeviceDidNotSealIsNoSuccess) {
 
 TEST_F(SyncRunnerTest, ASealThatOutlivesTheReconcileMeansNothingToDo) {
   EXPECT_EQ(run().outcome, SyncOutcome::kNull);
-  script.duringReconcile = [&] { device.memory.memoryFiles.removeItem(kLastSyncedPath, nullptr); };
+  script.duringReconcile = [&] {
+    device.memory.memoryFiles.removeItem(KXPreviousMetadataSyncFilePath, nullptr);
+  };
   ask({"A"});
   script.duringTransfer = [&](const FRAssetPtr&) {
-    device.memory.memoryFiles.putText(kLastSyncedPath, "sealed");
+    device.memory.memoryFiles.putText(KXPreviousMetadataSyncFilePath, "sealed");
   };
   EXPECT_EQ(run().outcome, SyncOutcome::kSynced);
 }
@@ -259,7 +264,7 @@ TEST_F(SyncRunnerTest, SumsTheChangesByIdentifier) {
 
 TEST_F(SyncRunnerTest, PutsTheSnapshotInPlaceOnce) {
   run();
-  const DataPtr there = device.memory.memoryFiles.readFile(kSnapshotPath, nullptr);
+  const DataPtr there = device.memory.memoryFiles.readFile(kKXSnapshotPath, nullptr);
   ASSERT_TRUE(there);
   EXPECT_TRUE(there->isEqualToData(*link.snapshotBytes));
   nameLibrary(kLibrary);
@@ -391,8 +396,8 @@ INSTANTIATE_TEST_SUITE_P(Counts, GuardTest,
 
 TEST_F(SyncRunnerTest, TheSealedSnapshotItselfIsNotComparedAgain) {
   seedAssets(60);
-  device.memory.memoryFiles.writeFileAtomically(kLastSyncedPath, link.snapshotBytes->span(),
-                                                nullptr);
+  device.memory.memoryFiles.writeFileAtomically(KXPreviousMetadataSyncFilePath,
+                                                link.snapshotBytes->span(), nullptr);
   const std::size_t opened = device.memory.library.openedLibraries();
   EXPECT_EQ(run().exitCode, kExitDone);
   EXPECT_EQ(device.memory.library.openedLibraries(), opened);
@@ -457,12 +462,15 @@ TEST_F(SyncRunnerTest, ForgetsOldFailuresBeforePreparing) {
 
 TEST_F(SyncRunnerTest, KnowsAResyncByTheFilesOfTheDevice) {
   nameLibrary(kLibrary);
-  device.memory.memoryFiles.removeItem(kLastSyncedPath, nullptr);
-  script.duringPrepare = [&] { device.memory.memoryFiles.putText(kLastSyncedPath, "sealed"); };
+  device.memory.memoryFiles.removeItem(KXPreviousMetadataSyncFilePath, nullptr);
+  script.duringPrepare = [&] {
+    device.memory.memoryFiles.putText(KXPreviousMetadataSyncFilePath, "sealed");
+  };
   EXPECT_FALSE(run().resync);
   const DataPtr other =
       plistBytes(snapshotRoot({}, {{"libraryUUID", Value::string("another library")}}));
-  device.memory.memoryFiles.writeFileAtomically(kLastSyncedPath, other->span(), nullptr);
+  device.memory.memoryFiles.writeFileAtomically(KXPreviousMetadataSyncFilePath, other->span(),
+                                                nullptr);
   script.duringPrepare = {};
   EXPECT_TRUE(run().resync);
 }

@@ -118,6 +118,14 @@ TEST_F(FRLogTest, ControlCharactersAreEscaped) {
   EXPECT_EQ(sync_->lines.at(0).text, "a\\x1b[2Jb\\x09c");
 }
 
+TEST_F(FRLogTest, EscapesCountForTheLimitAndAreNotSplit) {
+  KX_LOG("Source", "function", LogLevel::kInfo, "%@", std::string(limits::kLogLineBytes, '\x1b'));
+  const std::string& text = sync_->lines.at(0).text;
+  EXPECT_LE(text.size(), limits::kLogLineBytes);
+  EXPECT_GT(text.size(), limits::kLogLineBytes - 4);
+  EXPECT_TRUE(text.ends_with("\\x1b"));
+}
+
 TEST_F(FRLogTest, StandardLogAndSyncLogAloneCanBeWritten) {
   writeStandardLog("standard %d", {1});
   writeSyncLog({"Source", "function", 1, kLogFacility}, LogLevel::kError, "sync only", {});
