@@ -132,6 +132,9 @@ void addClientCalls(DriveSession& session, DriveCallTable& table) {
         return DriveAnswer{plistJson(session.client().installedAssetMetrics()), nullptr};
       }};
   table["prepareForSync"].waitsForSaver = true;
+  for (const char* call : {"prepareForSync", "reconcileSync"}) {
+    table[call].mayRunOnMainThread = true;
+  }
   table["assetTransferEnded"].waitsForSaver = true;
   table["client.new"] = {DriveLane::kConsole,
                          [&session](const DriveArguments&) {

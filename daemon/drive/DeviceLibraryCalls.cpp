@@ -50,8 +50,13 @@ std::vector<std::int64_t> integers(const DriveArguments& arguments, const char* 
   const Json* array = arguments.optionalArray(key);
   if (array == nullptr) return numbers;
   for (const Json& element : *array) {
-    if (!element.is_number_integer()) {
-      throw DriveException(kBadArgument, "argument \"" + std::string(key) + "\" holds no integer");
+    const bool fits = element.is_number_integer() &&
+                      !(element.is_number_unsigned() &&
+                        element.get<std::uint64_t>() >
+                            static_cast<std::uint64_t>(std::numeric_limits<std::int64_t>::max()));
+    if (!fits) {
+      throw DriveException(
+          kBadArgument, "argument \"" + std::string(key) + "\": expected array of 64-bit integers");
     }
     numbers.push_back(element.get<std::int64_t>());
   }
@@ -112,6 +117,9 @@ DeviceAssetFields assetFields(const DriveArguments& fields) {
   DeviceAssetFields set;
   set.uuid = fields.optionalString("uuid");
   set.path = fields.optionalString("path");
+  if (set.path && DeviceRoot::checkPath(*set.path) != 0) {
+    throw DriveException(kBadArgument, "argument \"fields.path\" is no device path");
+  }
   if (fields.has("savedAssetType")) set.savedAssetType = int32(fields, "savedAssetType", 0);
   if (fields.has("isVideo")) set.isVideo = fields.boolean("isVideo", false);
   if (fields.has("incomplete")) set.incomplete = fields.boolean("incomplete", false);

@@ -87,20 +87,46 @@ DriveConsole::Outcome DriveConsole::perform(const DriveCall& call, const Json& l
   return outcome;
 }
 
-void DriveConsole::start(const std::string& name, const DriveCall& call, Json line, Json* extra) {
+DriveConsole::Outcome DriveConsole::performAndWait(const DriveCall& call, const Json& line) {
+  // A call that waits for a held batch would wait for ever: no later line could release it.
+  const bool waits =
+      call.waitsForSaver || (call.lane == DriveLane::kPlugin && isStartedOnPluginQueue());
+  if (waits) session_.platform().saver().setMayHold(false);
+  Outcome outcome;
+  if (call.isForMainThread(DriveArguments(line))) {
+    // A client is never called on two threads at once.
+    session_.plugin().queue().drain();
+    outcome = perform(call, line);
+  } else if (call.lane == DriveLane::kConsole) {
+    outcome = perform(call, line);
+  } else {
+    session_.plugin().queue().sync([&] { outcome = perform(call, line); });
+  }
+  if (waits) session_.platform().saver().setMayHold(true);
+  return outcome;
+}
+
+void DriveConsole::start(const std::string& name, const DriveCall& call, const Line& line,
+                         Json* extra) {
   if (started_.size() >= kMostStarted) {
     throw DriveException("TooManyStarted", "wait for a call that was started before");
   }
+  const bool onMainThread = call.isForMainThread(DriveArguments(*line));
   const auto started = std::make_shared<Started>();
   started->name = name;
   started->lane = call.lane;
   started_[++lastStarted_] = started;
+  (*extra)["started"] = lastStarted_;
+  if (onMainThread) {
+    started->outcome = performAndWait(call, *line);
+    started->done.signal();
+    return;
+  }
   DispatchQueue& queue = call.lane == DriveLane::kPlugin ? session_.plugin().queue() : *background_;
-  queue.async([this, started, call, arguments = std::move(line)] {
-    started->outcome = perform(call, arguments);
+  queue.async([this, started, call, line] {
+    started->outcome = perform(call, *line);
     started->done.signal();
   });
-  (*extra)["started"] = lastStarted_;
 }
 
 DriveConsole::Outcome DriveConsole::wait(const DriveArguments& arguments, Json* extra) {
@@ -118,9 +144,9 @@ DriveConsole::Outcome DriveConsole::wait(const DriveArguments& arguments, Json* 
   return std::move(started->outcome);
 }
 
-DriveConsole::Outcome DriveConsole::dispatch(const Json& line, const std::string& name,
+DriveConsole::Outcome DriveConsole::dispatch(const Line& line, const std::string& name,
                                              Json* extra) {
-  const DriveArguments arguments(line);
+  const DriveArguments arguments(*line);
   if (name == "wait") return wait(arguments, extra);
   const auto found = table_.find(name);
   if (found == table_.end()) throw DriveException(kUnknownCall, "unknown call \"" + name + "\"");
@@ -128,22 +154,9 @@ DriveConsole::Outcome DriveConsole::dispatch(const Json& line, const std::string
   if (call.lane == DriveLane::kPlugin && session_.platform().saver().heldBatches() >= kMostHeld) {
     throw DriveException("TooManyHeld", "device.releaseSaver lets go what the saver holds");
   }
-  if (arguments.boolean("async", false)) {
-    start(name, call, line, extra);
-    return {};
-  }
-  // A call that waits for a held batch would wait for ever: no later line could release it.
-  const bool waits =
-      call.waitsForSaver || (call.lane == DriveLane::kPlugin && isStartedOnPluginQueue());
-  if (waits) session_.platform().saver().setMayHold(false);
-  Outcome outcome;
-  if (call.lane == DriveLane::kConsole || arguments.boolean("onMainThread", false)) {
-    outcome = perform(call, line);
-  } else {
-    session_.plugin().queue().sync([&] { outcome = perform(call, line); });
-  }
-  if (waits) session_.platform().saver().setMayHold(true);
-  return outcome;
+  if (!arguments.boolean("async", false)) return performAndWait(call, *line);
+  start(name, call, line, extra);
+  return {};
 }
 
 bool DriveConsole::isStartedOnPluginQueue() const {
@@ -155,9 +168,9 @@ Json DriveConsole::answer(const std::string& text) {
   Json answer{{"call", nullptr}};
   Outcome outcome;
   try {
-    const Json line = Json::parse(text, nullptr, false);
-    if (!line.is_object()) throw DriveException(kBadLine, "the line is no JSON object");
-    const std::string name = DriveArguments(line).string("call");
+    const auto line = std::make_shared<const Json>(Json::parse(text, nullptr, false));
+    if (!line->is_object()) throw DriveException(kBadLine, "the line is no JSON object");
+    const std::string name = DriveArguments(*line).string("call");
     answer["call"] = name;
     outcome = dispatch(line, name, &answer);
   } catch (const DriveException& exception) {

@@ -15,8 +15,8 @@
 namespace kx {
 
 // The drive console: one JSON object a line in, one out, in order. Every call into the plug-in is
-// made on the plug-in queue (on the calling thread where the line says "onMainThread"). A line that
-// cannot be understood is answered, too. Runs on the main thread.
+// made on the plug-in queue (on the calling thread where a call that takes "onMainThread" says so).
+// A line that cannot be understood is answered, too. Runs on the main thread.
 class DriveConsole {
  public:
   // The session outlives the console.
@@ -37,11 +37,14 @@ class DriveConsole {
     std::optional<RaisedException> exception;
   };
 
-  Outcome dispatch(const nlohmann::ordered_json& line, const std::string& name,
-                   nlohmann::ordered_json* extra);
+  // A line is shared, never copied: copying one that is nested very deep would end the process.
+  using Line = std::shared_ptr<const nlohmann::ordered_json>;
+
+  Outcome dispatch(const Line& line, const std::string& name, nlohmann::ordered_json* extra);
   Outcome wait(const DriveArguments& arguments, nlohmann::ordered_json* extra);
-  void start(const std::string& name, const DriveCall& call, nlohmann::ordered_json line,
+  void start(const std::string& name, const DriveCall& call, const Line& line,
              nlohmann::ordered_json* extra);
+  Outcome performAndWait(const DriveCall& call, const nlohmann::ordered_json& line);
   bool isStartedOnPluginQueue() const;
   Outcome perform(const DriveCall& call, const nlohmann::ordered_json& line);
 

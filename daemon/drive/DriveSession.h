@@ -34,6 +34,12 @@ struct DriveCall {
   std::function<DriveAnswer(const DriveArguments&)> run;
   // Whether it waits for batches of the saver.
   bool waitsForSaver = false;
+  // Whether it takes "onMainThread".
+  bool mayRunOnMainThread = false;
+
+  bool isForMainThread(const DriveArguments& arguments) const {
+    return mayRunOnMainThread && arguments.boolean("onMainThread", false);
+  }
 };
 using DriveCallTable = std::map<std::string, DriveCall, std::less<>>;
 

@@ -29,6 +29,15 @@ class Lines(ConsoleTest):
         self.assertEqual(self.console.line(" " * (64 << 20) + "{}")["exception"]["name"], "BadLine")
         self.assertEqual(self.call("currentSyncAnchor"), "1")
 
+    def test_lines_nested_very_deep_do_no_harm(self):
+        for inside in ("[" * 150000 + "]" * 150000, '{"a":' * 150000 + "1" + "}" * 150000):
+            for call in ("device.paths", "records.archive", "currentSyncAnchor"):
+                line = f'{{"call":"{call}","item":{{"x":{inside}}}}}'
+                self.console.line(line)
+                number = self.console.line(line.replace("{", '{"async":true,', 1))["started"]
+                self.assertEqual(self.console.raw("wait", of=number)["call"], call)
+        self.assertEqual(self.call("currentSyncAnchor"), "1")
+
     def test_missing_and_mistyped_arguments_are_named(self):
         answer = self.console.raw("device.addAsset", uuid="x")
         self.assertEqual(answer["exception"], {"name": "BadArgument",
@@ -75,9 +84,22 @@ class ClientCalls(ConsoleTest):
     def test_reconcile_without_a_snapshot(self):
         answer = self.console.raw("reconcileSync", type=3, newAnchor="2")
         self.assertFalse(answer["result"])
-        self.assertTrue(answer["error"]["message"])
+        self.assertEqual((answer["error"]["domain"], answer["error"]["code"]),
+                         ("com.veltro.plist", 1))
+        self.assertIn("No such file or directory", answer["error"]["message"])
         self.assertLogged(INFO, "Reconcile Sync: (type=3) anchor: 2")
         self.assertLogged(ERROR, "snapshot (null) err: (null)")
+
+    def test_a_sync_on_the_main_thread_raises(self):
+        reason = "Ferrule plugins should only be run on a non-main-thread queue!"
+        raised = {"name": "InternalInconsistency", "reason": reason}
+        for call in ("prepareForSync", "reconcileSync"):
+            for asynchronous in (False, True):
+                answer = self.console.raw(call, onMainThread=True, **{"async": asynchronous})
+                if asynchronous:
+                    self.assertIsNone(answer["exception"])
+                    answer = self.console.raw("wait", of=answer["started"])
+                self.assertEqual((answer["call"], answer["exception"]), (call, raised))
 
     def test_paths_to_backup(self):
         self.assertEqual(self.call("pathsToBackup", pathsNotToBackup=["keep"]),
@@ -255,6 +277,20 @@ class DeviceCalls(ConsoleTest):
         self.call("device.removeAsset", uuid=own)
         dump = self.dump()
         self.assertEqual((dump["assets"], dump["albums"][0]["assets"]), ({}, []))
+
+    def test_what_no_library_holds_is_refused(self):
+        own = uid("own")
+        place = {"uuid": own, "path": "/var/mobile/Media/DCIM/100CAMRA/1.JPG"}
+        for wrong in ({"path": "../1.JPG"}, {"sidecarSizes": [1 << 63]}, {"sidecarSizes": [0.5]},
+                      {"originalFilesize": 1 << 63}, {"savedAssetType": 1 << 31},
+                      {"faces": [{"identifier": 1 << 16}]}, {"location": [1]}):
+            with self.subTest(wrong=wrong), self.assertRaises(Raised):
+                self.call("device.addAsset", **{**place, **wrong})
+        self.call("device.addAsset", **place, sidecarSizes=[(1 << 63) - 1])
+        for wrong in ({"path": "../1.JPG"}, {"path": ""}, {"savedAssetType": 1 << 31}):
+            with self.subTest(wrong=wrong), self.assertRaises(Raised):
+                self.call("device.set", entity="asset", uuid=own, fields=wrong)
+        self.assertEqual(self.dump()["assets"][own]["path"], place["path"])
 
     def test_an_album_outside_its_list_is_reported(self):
         self.sync(library())
