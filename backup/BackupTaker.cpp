@@ -1,5 +1,6 @@
 #include "backup/BackupTaker.h"
 
+#include <fcntl.h>
 #include <sys/statvfs.h>
 
 #include <algorithm>
@@ -347,6 +348,13 @@ void Taking::copyTheLibrary() {
   progress_.phase = BackupPhase::kLibrary;
   report();
   const std::string path = incomingPath(backup_names::kLibrary);
+  // Made here, so that it is nobody else's to read; SQLite fills it.
+  UniqueFd made;
+  if (const int failed = folder_->root().openFile(path, O_WRONLY | O_CREAT | O_EXCL, &made);
+      failed != 0) {
+    throw Ending{writeFailure(path, failed)};
+  }
+  made.reset();
   ErrorPtr error;
   if (!copyLibrary(
           device_.root(), folder_->root().hostPath() + path, [this] { return goOn(); }, &error)) {

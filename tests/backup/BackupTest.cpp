@@ -181,6 +181,8 @@ TEST_F(BackupTest, TakesTheLibraryWhenAskedTo) {
   request_.withLibrary = true;
   const BackupResult result = taken();
   ASSERT_TRUE(result.manifest.library);
+  EXPECT_EQ(fs::status(backup_ + "/library.sqlite").permissions(),
+            fs::perms::owner_read | fs::perms::owner_write);
   EXPECT_EQ(static_cast<std::uintmax_t>(result.manifest.library->size),
             fs::file_size(backup_ + "/library.sqlite"));
   EXPECT_TRUE(damaged().empty());
