@@ -114,6 +114,7 @@ int parseAndPerform(const std::vector<std::string>& arguments, Console& console)
   addDumpCommand(app, parsed.action);
   addShowCommand(app, parsed.action);
   addSnapshotCommand(app, parsed.action);
+  addRestoreCommand(app, parsed.action);
   for (CLI::App* command : app.get_subcommands(nullptr)) addCommonOptions(*command, parsed.options);
 
   const std::string command = commandOf(app, arguments);

@@ -48,6 +48,7 @@ void addStatusCommand(CLI::App& app, Action& chosen);
 void addDumpCommand(CLI::App& app, Action& chosen);
 void addShowCommand(CLI::App& app, Action& chosen);
 void addSnapshotCommand(CLI::App& app, Action& chosen);
+void addRestoreCommand(CLI::App& app, Action& chosen);
 
 // Options of every command, kept until parsing is done.
 void addCommonOptions(CLI::App& command, CommonOptions& options);

@@ -1,14 +1,20 @@
 #include "cli/JsonOutput.h"
 
+#include "daemon/RestoreJson.h"
 #include "daemon/SyncJson.h"
 
 namespace kx::cli {
 
 std::string failureJson(const std::string& command, const ErrorPtr& error) {
-  if (command == "sync") {
+  if (command == "sync" || command == "plan") {
     SyncResult result;
     result.error = error;
     return jsonLine(syncResultJson(result));
+  }
+  if (command == "restore") {
+    RestoreResult result;
+    result.error = error;
+    return jsonLine(restoreResultJson(result));
   }
   nlohmann::ordered_json json;
   json["error"] = errorJson(error);

@@ -9,8 +9,9 @@
 
 namespace kx::cli {
 
-// What --json prints when a command fails: for `sync` its result with the outcome "failed", for
-// every other command {"error": {"domain","code","message"}}. One line with its line break.
+// What --json prints when a command fails: for `sync`, `plan` and `restore` the result with the
+// outcome "failed", for every other command {"error": {"domain","code","message"}}. One line with
+// its line break.
 std::string failureJson(const std::string& command, const ErrorPtr& error);
 
 // [{"path","text"}, ...]

@@ -34,6 +34,10 @@ const char* activityOf(SyncPhase phase) {
       return "transferring ...";
     case SyncPhase::kFinishing:
       return "finishing ...";
+    case SyncPhase::kOpeningBackup:
+      return "opening the backup and the device ...";
+    case SyncPhase::kPlanning:
+      return "looking for what is missing ...";
   }
   return "";
 }

@@ -195,6 +195,7 @@ Staging::Result Staging::take(const FileDescriptor& source, const OnBytes& onByt
   result.error = refusalOf(before);
   if (!result.error && !hasRoomFor(static_cast<std::uint64_t>(before.st_size))) {
     result.error = errorOf({ENOSPC, true, false});
+    result.ofDevice = true;
   }
   if (result.error) return result;
 
@@ -202,6 +203,7 @@ Staging::Result Staging::take(const FileDescriptor& source, const OnBytes& onByt
   FileDescriptor target = create(&name);
   if (!target.valid()) {
     result.error = errorOf({errno, true, false});
+    result.ofDevice = true;
     return result;
   }
   const auto size = static_cast<std::uint64_t>(before.st_size);
@@ -225,6 +227,7 @@ Staging::Result Staging::take(const FileDescriptor& source, const OnBytes& onByt
   }
   ::unlinkat(directory_.get(), name.c_str(), 0);
   result.cancelled = end.cancelled;
+  result.ofDevice = end.writing;
   if (!end.cancelled) result.error = errorOf(end);
   return result;
 }

@@ -30,7 +30,8 @@ int readWhole(int file, std::vector<std::uint8_t>& bytes);
 // failure.
 FileDescriptor openDirectoryBeneath(int root, const std::string& path, bool create);
 
-// Bytes that may still be written beneath the directory; 0 when that cannot be told.
+// Bytes that may still be written beneath the directory, or where it would be made; 0 when that
+// cannot be told.
 std::uint64_t freeBytesAt(const std::string& directory);
 
 // The daemon's staging directory on the device. File names in it are counted, never the host's, and
@@ -45,6 +46,7 @@ class Staging {
     std::uint64_t bytes = 0;  // size of the file
     ErrorPtr error;           // domain "FRError", null on success
     bool cancelled = false;   // given up because the callback said so; neither path nor error
+    bool ofDevice = false;    // the error is of the side that is written
   };
   // Called between chunks with the bytes moved since the last call; false gives up.
   using OnBytes = std::function<bool(std::uint64_t bytes)>;

@@ -25,7 +25,16 @@ struct SyncOptions {
   std::uint64_t reserveBytes = 64ULL << 20;
 };
 
-enum class SyncPhase { kChecking, kPreparing, kReconciling, kTransferring, kFinishing };
+// The last two are a restore's own.
+enum class SyncPhase {
+  kChecking,
+  kPreparing,
+  kReconciling,
+  kTransferring,
+  kFinishing,
+  kOpeningBackup,
+  kPlanning
+};
 
 struct SyncProgress {
   SyncPhase phase = SyncPhase::kChecking;

@@ -5,9 +5,6 @@
 namespace kx {
 namespace {
 
-// One try and two more.
-constexpr int kAttempts = 3;
-
 // Codes of kFRErrorDomain after which trying again can help. A full disk is recoverable, too, but
 // only by somebody who makes room.
 bool isWorthRetrying(const ErrorPtr& error) {
@@ -60,7 +57,7 @@ void TransferLoop::transfer(const FRAssetPtr& request) {
 
 Staging::Result TransferLoop::fetch(const FRAsset& request) {
   Staging::Result fetched;
-  for (int attempt = 0; attempt < kAttempts; ++attempt) {
+  for (int attempt = 0; attempt < kTransferAttempts; ++attempt) {
     fetched = fetchOnce(request);
     if (!isWorthRetrying(fetched.error)) break;
   }

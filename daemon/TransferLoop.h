@@ -10,6 +10,9 @@
 
 namespace kx {
 
+// One try and two more.
+inline constexpr int kTransferAttempts = 3;
+
 // Moves the files that the plug-in asks for into staging and reports each request once. Used on one
 // thread; the plug-in is called on its own queue meanwhile.
 class TransferLoop {

@@ -3,15 +3,19 @@
 #include <atomic>
 #include <map>
 #include <memory>
+#include <mutex>
 #include <optional>
 #include <set>
 #include <string>
+#include <unordered_map>
 #include <vector>
 
+#include "device/CameraRoll.h"
 #include "device/DeviceFileSystem.h"
 #include "device/LibraryStore.h"
 #include "device/MediaFolders.h"
 #include "device/MediaStore.h"
+#include "device/RestoreMarker.h"
 #include "platform/dispatch/Dispatch.h"
 #include "platform/library/KXAssetsSaver.h"
 
@@ -33,7 +37,11 @@ class Quarryd {
 
   void save(std::vector<DataPtr> jobs, KXAssetsSaver::Completion completion);
   void updateRestoredAsset(std::optional<std::string> uuid, std::vector<std::string> paths);
+  // Ends a restore that a marker tells of: completes what is there; with `recreateAlbums` it also
+  // takes in the camera's files that the library does not know, and the albums of the backup.
   void finalizeRestore(bool recreateAlbums);
+  // While a restore runs no sync is sealed.
+  void setRestoring(bool restoring) { restoring_ = restoring; }
   // Files below the synced-assets directory that no row names any more.
   void removeFiles(std::vector<std::string> paths);
   // Whether a file that had to go is still there.
@@ -64,12 +72,21 @@ class Quarryd {
   [[nodiscard]] ErrorPtr seal(const std::string& snapshotPath);
   [[nodiscard]] std::optional<std::string> whyNotWhole(const DataPtr& snapshot);
 
-  void completeRestoredAsset(const std::string& uuid);
+  // Restores.
+  [[nodiscard]] ErrorPtr completeAssets(const std::vector<std::string>& uuids);
+  void endRestore(bool recreateAlbums);
+  [[nodiscard]] ErrorPtr registerCameraFiles(const std::vector<RestoredAlbum>& albums);
+  std::vector<CameraAsset> unknownCameraAssets();
+  void recreateAlbum(LibraryWriter& writer, const RestoredAlbum& album,
+                     const std::unordered_map<std::string, RowId>& rows);
 
   Parts parts_;
   DeviceFileSystem files_;
   MediaFolders folders_;
   std::atomic<bool> leftFilesBehind_{false};
+  std::atomic<bool> restoring_{false};
+  std::mutex restoredMutex_;
+  std::vector<std::string> restored_;  // assets with new files that nobody has looked at yet
   DispatchQueuePtr completions_;
   DispatchQueuePtr work_;  // last: its blocks use the rest
 };

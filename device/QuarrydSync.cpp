@@ -81,6 +81,7 @@ ErrorPtr Quarryd::cleanUp(const HandOver& handOver, const std::optional<Date>& b
 
 std::optional<std::string> Quarryd::whyNotWhole(const DataPtr& snapshot) {
   LibraryStore& store = *parts_.store;
+  if (restoring_) return "a restore is under way";
   if (store.health().anyFailure()) return "something failed since the sync began";
   std::string why;
   std::optional<ModificationDates> wanted = assetsOfSnapshot(snapshot, &why);

@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <mutex>
 #include <stdexcept>
 
 #include "device/DeviceErrors.h"
@@ -64,12 +65,16 @@ class DevicePorter : public KXPorterClient {
   Quarryd* const quarryd_;
 };
 
-// Outside a restore nothing is coming back.
-class NoRestore : public QBManager {
+// The files that a restore is bringing back; outside of one there are none.
+class RestoreFiles : public QBManager {
  public:
+  explicit RestoreFiles(std::vector<QBFile> files) : files_(std::move(files)) {}
   std::optional<std::vector<QBFile>> restoreFilesForDomain(const std::string&, ErrorPtr*) override {
-    return std::vector<QBFile>();
+    return files_;
   }
+
+ private:
+  const std::vector<QBFile> files_;
 };
 
 class StoreDevice : public ReferenceDevice, public Platform {
@@ -88,6 +93,7 @@ class StoreDevice : public ReferenceDevice, public Platform {
   DeviceCounters takeCounters() override { return store_->takeCounters(); }
   DeviceAdmin& admin() override { return *admin_; }
   DeviceRoot& root() override { return *root_; }
+  void setRestoreFiles(std::optional<std::vector<QBFile>> files) override;
   void drain() override;
   DeviceDump dump(bool hash, ErrorPtr* error) override;
 
@@ -97,7 +103,7 @@ class StoreDevice : public ReferenceDevice, public Platform {
   KXPhotoLibraryFramework& photoLibrary() override { return *framework_; }
   KXAssetsSaver& sharedAssetsSaver() override { return *saver_; }
   KXPorterClient& porterClient() override { return *porter_; }
-  std::unique_ptr<QBManager> newBackupManager() override { return std::make_unique<NoRestore>(); }
+  std::unique_ptr<QBManager> newBackupManager() override;
   LogSinks logs() override { return options_.logs; }
   std::unique_ptr<MemoryPressureSource> newMemoryPressureSource() override {
     return std::make_unique<KernelMemoryPressure>(globalQueue_, kPressureFile);
@@ -125,6 +131,8 @@ class StoreDevice : public ReferenceDevice, public Platform {
   std::unique_ptr<DeviceSaver> saver_;
   std::unique_ptr<DevicePorter> porter_;
   DispatchQueuePtr globalQueue_;
+  std::mutex restoreMutex_;
+  std::vector<QBFile> restoreFiles_;
 };
 
 ErrorPtr StoreDevice::start() {
@@ -183,6 +191,9 @@ ErrorPtr StoreDevice::openForWriting() {
   if (const int failed = lock_->markInUse(); failed != 0) {
     return systemError("cannot write", device_paths::kLock, failed);
   }
+  if (options_.beforeLibrary) {
+    if (ErrorPtr failed = options_.beforeLibrary(root_)) return failed;
+  }
   OpenedLibrary library =
       openLibraryForWriting(root_->hostPath() + device_paths::kDatabase, &error);
   if (!library.database) return error;
@@ -194,7 +205,9 @@ ErrorPtr StoreDevice::openForWriting() {
   }
   makeStore(std::move(library));
   // The store is used by this thread alone until its queue gets its first block.
-  if (ErrorPtr failed = DeviceRecovery(root_, *store_).run(lock_->lastState())) return failed;
+  const std::optional<CleanState> last =
+      options_.beforeLibrary ? std::nullopt : lock_->lastState();
+  if (ErrorPtr failed = DeviceRecovery(root_, *store_).run(last)) return failed;
   health_.reset();
   std::unique_ptr<MediaStore> media = std::make_unique<FileMediaStore>(root_);
   if (options_.decorateMedia) media = options_.decorateMedia(std::move(media));
@@ -213,6 +226,17 @@ void StoreDevice::makeStore(OpenedLibrary library) {
   parts.log = &log_;
   parts.readOnly = options_.readOnly;
   store_ = std::make_shared<LibraryStore>(std::move(parts));
+}
+
+void StoreDevice::setRestoreFiles(std::optional<std::vector<QBFile>> files) {
+  if (quarryd_) quarryd_->setRestoring(files.has_value());
+  const std::lock_guard<std::mutex> lock(restoreMutex_);
+  restoreFiles_ = files ? std::move(*files) : std::vector<QBFile>();
+}
+
+std::unique_ptr<QBManager> StoreDevice::newBackupManager() {
+  const std::lock_guard<std::mutex> lock(restoreMutex_);
+  return std::make_unique<RestoreFiles>(restoreFiles_);
 }
 
 void StoreDevice::drain() {

@@ -92,6 +92,9 @@ struct DeviceOptions {
   Clock* clock = nullptr;             // null: the real one; must outlive the device
   MediaStoreDecorator decorateMedia;  // null: the media store as it is
   std::size_t filesPerFolder = 1000;  // of the synced-assets directory
+  // Called when the device has been locked for writing, before its library is opened; an error ends
+  // the opening. With it the device is looked through as after an unclean stop.
+  std::function<ErrorPtr(const std::shared_ptr<DeviceRoot>&)> beforeLibrary;
 };
 
 // What the library has done since the last call.
@@ -117,6 +120,9 @@ class ReferenceDevice {
   virtual DeviceCounters takeCounters() = 0;
   virtual DeviceAdmin& admin() = 0;
   virtual DeviceRoot& root() = 0;
+  // What the backup manager answers from now on: these files while a restore brings them back (no
+  // sync is sealed meanwhile), an empty list for nothing, as in the beginning.
+  virtual void setRestoreFiles(std::optional<std::vector<QBFile>> files) = 0;
   // Waits until quarryd and the library's queue have nothing to do.
   virtual void drain() = 0;
   // One consistent reading; works in a read-only device too. `hash` adds SHA-256 of the files.

@@ -5,8 +5,7 @@
 #include <optional>
 #include <string>
 
-// The Gregorian calendar in UTC for the years 1 to 9999, without leap seconds. Internal to
-// platform/foundation.
+// The Gregorian calendar in UTC for the years 1 to 9999, without leap seconds.
 namespace kx {
 
 struct CivilTime {

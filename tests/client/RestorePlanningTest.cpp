@@ -256,6 +256,41 @@ TEST_F(RestorePlanningTest, ANewPlanDropsTheGroupsOfTheOneBefore) {
   EXPECT_EQ(client->restorePathToAssetGroup()->size(), 1U);
 }
 
+TEST_F(RestorePlanningTest, TheOrderIsThatOfTheBytesAndTheGroupsThatOfTheList) {
+  const std::string lower = std::string(kDcim) + "/100AB/a.JPG";
+  platform.backup.paths = {lower, kB, kA};
+  EXPECT_EQ(plan(), (Texts{kA, kB, lower}));
+  Texts groups;
+  for (const auto& entry : *client->restorePathToAssetGroup()) groups.emplace_back(entry.key.stringValue());
+  const std::string folder = std::string(kDcim) + "/100AB/";
+  EXPECT_EQ(groups, (Texts{folder + "a", folder + "B", folder + "A"}));
+}
+
+TEST_F(RestorePlanningTest, TheContextIsWrittenByAFirstAttemptAlone) {
+  for (const bool useDatabase : {true, false}) {
+    writeContext(
+        Dictionary({{kKXSyncRestoreContextUseDatabaseKey, Value::boolean(useDatabase)},
+                    {kKXSyncRestoreContextRestoredFilesKey, Value::array({Value::string(kC)})}}));
+    client->_clearSyncState();
+    int writes = 0;
+    platform.faultyFiles.setFault([&](std::string_view operation, const std::string&) -> ErrorPtr {
+      writes += operation == "writeFileAtomically" ? 1 : 0;
+      return nullptr;
+    });
+    plan();
+    EXPECT_EQ(writes, 0);
+  }
+}
+
+TEST_F(RestorePlanningTest, OneCountOfTheTwoAlbumsAloneIsEnoughToWriteIt) {
+  platform.backup.paths = {kA};
+  setPending(OwnAlbum::kShoebox, 4, 0);          // the type is right already
+  setPending(OwnAlbum::kRestoreProgress, 1, 1);  // the count is
+  plan();
+  EXPECT_EQ(pending(OwnAlbum::kShoebox), "t4 n1");
+  EXPECT_EQ(pending(OwnAlbum::kRestoreProgress), "t4 n1");
+}
+
 TEST_F(RestorePlanningTest, CountsThatAreRightAlreadyAreNotWritten) {
   setPending(OwnAlbum::kShoebox, 1, 0);
   setPending(OwnAlbum::kRestoreProgress, 1, 0);

@@ -92,14 +92,50 @@ TEST_F(RestoreTransfersTest, AGroupWhoseFilesAllFailedIsReportedEmpty) {
 }
 
 TEST_F(RestoreTransfersTest, RecoverableFailuresChangeNothing) {
-  for (const ErrorPtr& error : {frError(7), frError(20), posixError(5), posixError(2)}) {
+  std::vector<ErrorPtr> errors = {posixError(5), posixError(2), Error::make("", 5),
+                                  Error::make("frerror", 5)};
+  for (const int code : {4, 7, 8, 9, 14, 16, 18, 19, 20}) errors.push_back(frError(code));
+  for (const ErrorPtr& error : errors) {
+    SCOPED_TRACE(error->description());
     platform.captured.clear();
     client->assetTransfer(request(kA), false, error);
     EXPECT_EQ(status(kA), 0);
     EXPECT_EQ(outstanding(), (Texts{kA, kMovie}));
+    EXPECT_EQ(restoredInMemory(), Texts{});
+    EXPECT_EQ(restoredOnDisk(), (Texts{"(null)"}));
+    EXPECT_TRUE(logged(LogLevel::kInfo, "Looking at group KXSyncAssetGroup"));
     EXPECT_TRUE(logged(LogLevel::kInfo, "Group is pending..."));
     EXPECT_TRUE(platform.porter.updates().empty());
   }
+}
+
+TEST_F(RestoreTransfersTest, EveryOtherCodeOfTheFrameworkIsForGood) {
+  std::vector<std::int64_t> codes = {-1, 21, 100};
+  for (std::int64_t code = 0; code <= 20; ++code) codes.push_back(code);
+  for (const std::int64_t recoverable : {4, 7, 8, 9, 14, 16, 18, 19, 20}) {
+    std::erase(codes, recoverable);
+  }
+  for (const std::int64_t code : codes) {
+    SCOPED_TRACE(code);
+    client->_clearSyncState();
+    platform.memoryFiles.removeItem(KXSyncClient::pathToRestoreContext(platform), nullptr);
+    client->outstandingAssetTransfers();
+    client->assetTransfer(request(kA), false, frError(code));
+    EXPECT_EQ(status(kA), 1);
+    EXPECT_EQ(outstanding(), (Texts{kMovie}));
+    EXPECT_EQ(restoredOnDisk(), (Texts{kA}));
+  }
+}
+
+TEST_F(RestoreTransfersTest, APathThatIsThereTwiceIsSettledTwice) {
+  // Two assets may name one file; nothing removes the second.
+  client->_clearSyncState();
+  platform.memoryFiles.removeItem(KXSyncClient::pathToRestoreContext(platform), nullptr);
+  platform.backup.paths = {kA, kA};
+  client->outstandingAssetTransfers();
+  client->assetTransfer(request(kA), false, frError(5));
+  EXPECT_EQ(restoredOnDisk(), (Texts{kA, kA}));
+  EXPECT_EQ(platform.porter.updates(), (Updates{{"UA", {}}}));
 }
 
 TEST_F(RestoreTransfersTest, AFailureWithoutErrorEndsAtOnce) {

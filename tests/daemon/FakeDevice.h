@@ -36,6 +36,7 @@ class FakeDevice : public ReferenceDevice {
   // A sync does without these two.
   DeviceAdmin& admin() override { throw std::logic_error("no admin"); }
   DeviceRoot& root() override { throw std::logic_error("no root"); }
+  void setRestoreFiles(std::optional<std::vector<QBFile>>) override {}
   void drain() override { memory.saver.drain(); }
   DeviceDump dump(bool, ErrorPtr*) override { return {}; }
 
