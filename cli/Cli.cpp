@@ -21,6 +21,7 @@ constexpr const char* kExamples =
     "Examples:\n"
     "  kxsync sync ~/Pictures ./device     bring a folder of photos onto the device\n"
     "  kxsync status ./device              what is on it\n"
+    "  kxsync plan ~/Pictures ./device     say what that would do, and change nothing\n"
     "  kxsync dump ./device                all of it, as JSON\n"
     "\n"
     "kxsync COMMAND --help says more about a command.";
@@ -113,6 +114,7 @@ int parseAndPerform(const std::vector<std::string>& arguments, Console& console)
   addStatusCommand(app, parsed.action);
   addDumpCommand(app, parsed.action);
   addShowCommand(app, parsed.action);
+  addPlanCommand(app, parsed.action);
   addSnapshotCommand(app, parsed.action);
   addRestoreCommand(app, parsed.action);
   for (CLI::App* command : app.get_subcommands(nullptr)) addCommonOptions(*command, parsed.options);

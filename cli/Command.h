@@ -44,6 +44,7 @@ class UsageError : public std::runtime_error {
 
 // Each adds its command below `app`; when it was chosen, parsing stores its action.
 void addSyncCommand(CLI::App& app, Action& chosen);
+void addPlanCommand(CLI::App& app, Action& chosen);
 void addStatusCommand(CLI::App& app, Action& chosen);
 void addDumpCommand(CLI::App& app, Action& chosen);
 void addShowCommand(CLI::App& app, Action& chosen);

@@ -9,6 +9,7 @@
 #include "cli/JsonOutput.h"
 #include "cli/LibraryLink.h"
 #include "cli/Paths.h"
+#include "cli/PlanCommand.h"
 #include "cli/Progress.h"
 #include "daemon/SignalCancel.h"
 #include "daemon/SyncJson.h"
@@ -23,6 +24,7 @@ constexpr const char* kSyncExamples =
     "  kxsync sync ~/Pictures ./device                  a folder of photos\n"
     "  kxsync sync ./bundle ./device --json             a host bundle, the result for a script\n"
     "  kxsync sync ~/Few ./device --allow-deletes       also when most photos go away by it\n"
+    "  kxsync sync ~/Pictures ./device --dry-run        say what it would do, and change nothing\n"
     "\n"
     "Exit codes: 0 all done, 1 failed, 2 wrong usage, 3 some assets did not make it, 4 stopped by\n"
     "the guard, 6 no space left on the device, 7 another run holds the device, 130 or 143 ended "
@@ -30,13 +32,6 @@ constexpr const char* kSyncExamples =
     "a signal (the same command goes on from there).";
 
 constexpr std::size_t kFailuresShown = 10;
-
-struct SyncArguments {
-  std::string host;
-  std::string device;
-  bool allowDeletes = false;
-  FolderReading reading;
-};
 
 bool changedNothing(const SyncResult& result) {
   return result.outcome == SyncOutcome::kSynced && result.requested == 0 &&
@@ -139,6 +134,7 @@ int runSync(Context& context, const SyncArguments& arguments) {
   SyncOptions syncOptions;
   syncOptions.deviceRoot = arguments.device;
   syncOptions.allowDeletes = arguments.allowDeletes;
+  syncOptions.notice = [&context](const std::string& text) { context.console.warning(text); };
   SystemClock clock;
   ProgressDisplay display(context.console, clock);
   const auto onProgress = [&context, &display](const SyncProgress& progress) {
@@ -154,18 +150,15 @@ int runSync(Context& context, const SyncArguments& arguments) {
 void addSyncCommand(CLI::App& app, Action& chosen) {
   auto arguments = std::make_shared<SyncArguments>();
   CLI::App* command = app.add_subcommand("sync", "Bring a device in line with a host library");
-  command->add_option("HOST", arguments->host, "A folder of photos and videos, or a host bundle")
-      ->required()
-      ->type_name("PATH");
-  command->add_option("DEVICE", arguments->device, "The directory of the device; made when missing")
-      ->required()
-      ->type_name("PATH");
-  command->add_flag("--allow-deletes", arguments->allowDeletes,
-                    "Let this sync take away more than half of the synced photos");
-  addFolderReadingOptions(*command, arguments->reading);
+  addSyncArguments(*command, *arguments);
+  CLI::Option* dryRun = command->add_flag("--dry-run", arguments->dryRun,
+                                          "Say what would be done, and change nothing: as `plan`");
+  command->add_flag("--all", arguments->all, "With --dry-run: show every action")->needs(dryRun);
   command->footer(kSyncExamples);
   command->callback([arguments, &chosen] {
-    chosen = [arguments](Context& context) { return runSync(context, *arguments); };
+    chosen = [arguments](Context& context) {
+      return arguments->dryRun ? runPlan(context, *arguments) : runSync(context, *arguments);
+    };
   });
 }
 

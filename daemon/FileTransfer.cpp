@@ -259,7 +259,13 @@ void Staging::clear() {
 
 std::uint64_t freeBytesAt(const std::string& directory) {
   struct statvfs status {};
-  if (::statvfs(directory.c_str(), &status) != 0) return 0;
+  std::string there = directory.empty() ? "." : directory;
+  while (::statvfs(there.c_str(), &status) != 0) {
+    if (errno != ENOENT || there == "." || there == "/") return 0;
+    while (there.size() > 1 && there.back() == '/') there.pop_back();
+    const std::size_t slash = there.rfind('/');
+    there = slash == std::string::npos ? "." : there.substr(0, slash + 1);
+  }
   return static_cast<std::uint64_t>(status.f_bavail) * status.f_frsize;
 }
 

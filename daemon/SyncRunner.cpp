@@ -74,6 +74,24 @@ SyncResult syncDevice(HostLink& host, const SyncOptions& options, const LogSinks
   });
 }
 
+SyncPlan planSync(HostLink& host, const SyncOptions& options, const LogSinks& logs,
+                  const SyncProgressCallback& progress, const CancelToken& cancel) {
+  SyncPlan plan;
+  plan.result = catching([&] {
+    ErrorPtr error;
+    const auto snapshot = readHostSnapshot(host, &error);
+    if (!snapshot) return failedResult(error, kExitFailed);
+    DeviceOptions deviceOptions;
+    deviceOptions.root = options.deviceRoot;
+    deviceOptions.planOnly = true;
+    deviceOptions.logs = logs;
+    const auto device = ReferenceDevice::open(deviceOptions, &error);
+    if (!device) return failedResult(error, exitCodeForDeviceError(error));
+    return SyncSession({host, *device, options, progress, cancel, &plan}, *snapshot).run();
+  });
+  return plan;
+}
+
 bool isNoSpaceError(const ErrorPtr& error) {
   if (!error) return false;
   const std::int64_t code = error->code();

@@ -23,6 +23,8 @@ struct SyncOptions {
   std::shared_ptr<PluginModule> plugin;  // set: this one, whatever pluginPath says
   // Bytes that must stay free on the device beside what a sync brings.
   std::uint64_t reserveBytes = 64ULL << 20;
+  // Told of what the user should know before the first file is moved; null: nobody is.
+  std::function<void(const std::string&)> notice;
 };
 
 // The last two are a restore's own.

@@ -3,8 +3,9 @@
 #include <algorithm>
 #include <csignal>
 
+#include "daemon/PlannedTransfers.h"
+#include "daemon/RunErrors.h"
 #include "daemon/TransferLoop.h"
-#include "platform/foundation/Text.h"
 
 namespace kx {
 namespace {
@@ -12,17 +13,6 @@ namespace {
 // The plug-in only logs the type; 1 stands for a sync that the user asked for.
 constexpr std::uint32_t kSyncType = 1;
 constexpr const char* kAnchor = "1";
-constexpr const char* kNoSpaceText = "no space left on the device";
-
-ErrorPtr syncError(SyncErrorCode code, const std::string& message) {
-  return Error::make(kSyncErrorDomain, static_cast<std::int64_t>(code),
-                     escapeControlCharacters(message));
-}
-
-ErrorPtr prefixed(const std::string& prefix, const Error& error) {
-  const std::string text = error.message().empty() ? error.description() : error.message();
-  return Error::make(error.domain(), error.code(), escapeControlCharacters(prefix + ": " + text));
-}
 
 bool hasNeededOperations(const FRClient& client) {
   constexpr FROperation kNeeded[] = {
@@ -81,11 +71,22 @@ ErrorPtr SyncSession::checkAgainstDevice() {
   DeviceComparison comparison;
   ErrorPtr error = compareWithDevice(snapshot_.checked, context_.device.platform(), &comparison);
   if (!error) error = refuseDeviceMadeContainers(comparison);
-  if (!error && !context_.options.allowDeletes) {
-    error = guardAgainstDeletes(snapshot_.checked, comparison);
+  if (error) return error;
+  std::optional<GuardFacts> guard;
+  if (!context_.options.allowDeletes) {
+    guard = guardAgainstDeletes(snapshot_.checked, comparison, context_.device);
   }
-  if (!error) error = refuseWithoutSpace(comparison, context_.host, context_.options);
-  return error;
+  if (guard) error = guardError(*guard);
+  if (error && !context_.plan) return error;
+  const auto space = refuseWithoutSpace(snapshot_.checked, comparison, context_.host,
+                                        context_.device, context_.options);
+  if (space && !error) error = spaceError(*space);
+  if (!context_.plan) return error;
+  // A plan goes on, to say what would be done.
+  context_.plan->guard = guard;
+  context_.plan->space = space;
+  context_.plan->stop = error;
+  return nullptr;
 }
 
 // Whether the host's snapshot is, byte for byte, the one that the device sealed last.
@@ -119,7 +120,7 @@ bool SyncSession::checkBeforeFirstEffect() {
 
 bool SyncSession::putSnapshotInPlace() {
   ErrorPtr error = librarySwitch_.rollBack();
-  if (!error) staging_ = Staging::open(context_.options.deviceRoot, &error);
+  if (!error && !context_.plan) staging_ = Staging::open(context_.options.deviceRoot, &error);
   if (staging_) staging_->clear();
   // A file that holds these bytes already is left as it is.
   if (!error) files_.writeFileAtomically(kKXSnapshotPath, snapshot_.bytes->span(), &error);
@@ -204,7 +205,7 @@ bool SyncSession::predictResync() {
 }
 
 void SyncSession::transferAndEnd() {
-  enter(SyncPhase::kTransferring);
+  enter(context_.plan ? SyncPhase::kPlanning : SyncPhase::kTransferring);
   const bool allArrived = transfer();
   enter(SyncPhase::kFinishing);
   DeviceHealth& health = context_.device.health();
@@ -236,6 +237,8 @@ bool SyncSession::transfer() {
   for (const FRAssetPtr& request : outstanding) {
     if (request && !request->isRestore()) requested_.insert(request->identifier());
   }
+  if (context_.plan) return planTransfers(outstanding);
+  sayWhenTooSmall(outstanding);
   TransferLoop loop({context_.host, *staging_, *plugin_, context_.device.health(), context_.cancel,
                      context_.progress},
                     result_);
@@ -245,15 +248,42 @@ bool SyncSession::transfer() {
   return loop.allArrived();
 }
 
+bool SyncSession::planTransfers(const std::vector<FRAssetPtr>& outstanding) {
+  PlannedTransfers transfers({context_.host, *plugin_, context_.cancel, context_.progress}, result_,
+                             *context_.plan);
+  transfers.run(outstanding);
+  if (transfers.wasCancelled()) stopIfCancelled();
+  return transfers.allArrived();
+}
+
+// Changed files were no part of the check before the first effect.
+void SyncSession::sayWhenTooSmall(const std::vector<FRAssetPtr>& outstanding) {
+  std::uint64_t needed = 0;
+  for (const FRAssetPtr& request : outstanding) {
+    if (!request || request->isRestore()) continue;
+    const auto size = context_.host.mediaSize(request->identifier());
+    if (size && *size > 0) needed += static_cast<std::uint64_t>(*size);
+  }
+  const std::string& root = context_.options.deviceRoot;
+  if (needed == 0 || !shortage(needed, kWorkingBytes, freeBytesAt(root))) return;
+  // The files of assets that went make room first.
+  context_.device.drain();
+  const auto space = shortage(needed, kWorkingBytes, freeBytesAt(root));
+  if (space && context_.options.notice) {
+    context_.options.notice("not all files will fit: " + spaceError(*space)->message());
+  }
+}
+
 bool SyncSession::stopIfCancelled() {
   if (!context_.cancel.isCancelled()) return false;
   const int signal = context_.cancel.signal();
   cancelled_ = true;
   result_.outcome = SyncOutcome::kStopped;
   result_.exitCode = 128 + signal;
-  result_.error = syncError(SyncErrorCode::kCancelled,
-                            signal == SIGINT ? "interrupted; the same command goes on from here"
-                                             : "terminated; the same command goes on from here");
+  result_.error = syncError(
+      SyncErrorCode::kCancelled,
+      std::string(signal == SIGINT ? "interrupted" : "terminated") +
+          (context_.plan ? "; nothing was changed" : "; the same command goes on from here"));
   return true;
 }
 
@@ -272,21 +302,43 @@ void SyncSession::conclude() {
                      "the plug-in's end raised " + raised->name + ": " + raised->reason));
     }
   }
-  if (!staging_) return;
+  if (!staging_ && !context_.plan) return;
   context_.device.drain();
-  staging_->clear();
-  collectChanges();
+  if (staging_) staging_->clear();
+  const LibraryChanges changes = context_.device.takeChanges();
+  collectChanges(changes);
   if (ended_ && !cancelled_) judge();
+  if (context_.plan && !cancelled_) concludePlan(changes);
 }
 
-void SyncSession::collectChanges() {
+// What would stop the sync at its beginning comes before all that it would have met later.
+void SyncSession::concludePlan(const LibraryChanges& changes) {
+  SyncPlan& plan = *context_.plan;
+  ErrorPtr error;
+  plan.difference = context_.device.difference(changes, &error);
+  if (error) fail(prefixed("the device library cannot be read", *error));
+  for (const LibraryDifference::Asset& asset : plan.difference.assets) {
+    if (asset.content || asset.fate == LibraryDifference::Fate::kGone) {
+      plan.bytesToFree += static_cast<std::uint64_t>(asset.sizeBefore);
+    }
+  }
+  if (!plan.stop && !result_.error && plan.bytesToBring > 0) {
+    plan.space = shortage(plan.bytesToBring, kWorkingBytes,
+                          freeBytesAt(context_.options.deviceRoot) + plan.bytesToFree);
+    if (plan.space) plan.stop = spaceError(*plan.space);
+  }
+  if (!plan.stop) return;
+  result_.error = nullptr;
+  fail(plan.stop);
+}
+
+void SyncSession::collectChanges(const LibraryChanges& changes) {
   for (const auto& failure : context_.device.health().importFailures()) {
     const Error* error = failure.error.get();
     result_.failed.push_back(SyncFailure{failure.uuid, error ? error->domain() : "",
                                          error ? error->code() : 0,
                                          error ? error->message() : "the import failed"});
   }
-  const LibraryChanges changes = context_.device.takeChanges();
   result_.imported = changes.importedAssets.size();
   result_.deletedAssets = countWithout(changes.deletedAssets, requested_);
   std::set<std::string> replaced = changes.importedAssets;

@@ -10,6 +10,7 @@
 #include "daemon/LibrarySwitch.h"
 #include "daemon/PluginHost.h"
 #include "daemon/SnapshotChecker.h"
+#include "daemon/SyncPlan.h"
 #include "daemon/SyncRunner.h"
 
 namespace kx {
@@ -31,6 +32,7 @@ class SyncSession {
     const SyncOptions& options;
     const SyncProgressCallback& progress;
     const CancelToken& cancel;
+    SyncPlan* plan = nullptr;  // set: the device keeps nothing, and no file is moved
   };
   SyncSession(const Context& context, const HostSnapshot& snapshot);
 
@@ -44,6 +46,7 @@ class SyncSession {
   bool reconcile();
   void transferAndEnd();
   bool transfer();  // true when every file arrived
+  bool planTransfers(const std::vector<FRAssetPtr>& outstanding);
 
   bool callPrepare();
   bool callReconcile(ErrorPtr* error);
@@ -51,11 +54,13 @@ class SyncSession {
   void endWithoutTransfers();
   void settleLibrarySwitch(bool reconciled);
   void conclude();
-  void collectChanges();
+  void collectChanges(const LibraryChanges& changes);
   void judge();
   bool predictResync();
   bool matchesSeal();
   ErrorPtr checkAgainstDevice();
+  void sayWhenTooSmall(const std::vector<FRAssetPtr>& outstanding);
+  void concludePlan(const LibraryChanges& changes);
   void enter(SyncPhase phase);
   // Ends the run: notes the first error and the exit code that goes with it.
   void fail(const ErrorPtr& error);

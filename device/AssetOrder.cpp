@@ -2,7 +2,6 @@
 
 #include <cerrno>
 
-#include "device/DeviceErrors.h"
 #include "device/DeviceLayout.h"
 #include "platform/foundation/PropertyList.h"
 
@@ -46,12 +45,10 @@ std::shared_ptr<const AssetOrder::Album> AssetOrder::album(const std::optional<s
 void AssetOrder::read() {
   albums_.clear();
   orders_ = Value();
-  std::vector<std::uint8_t> bytes;
-  const int failed = root_->readFile(device_paths::kAssetOrder, &bytes);
-  if (failed == ENOENT) return;
-  ErrorPtr error = failed == 0 ? nullptr : posixError(device_paths::kAssetOrder, failed);
-  if (failed == 0)
-    orders_ = readPropertyList(std::make_shared<const Data>(std::move(bytes)), &error);
+  ErrorPtr error;
+  DataPtr bytes = files_.readFile(device_paths::kAssetOrder, &error);
+  if (!bytes && error && error->code() == ENOENT) return;
+  if (bytes) orders_ = readPropertyList(std::move(bytes), &error);
   if (error) log_.failure("the asset order file is passed over", error);
 }
 

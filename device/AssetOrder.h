@@ -9,7 +9,7 @@
 #include <unordered_map>
 
 #include "device/DeviceLog.h"
-#include "device/DeviceRoot.h"
+#include "platform/files/FileSystem.h"
 #include "platform/foundation/Value.h"
 
 namespace kx {
@@ -33,8 +33,7 @@ class AssetOrder {
     std::int64_t tag_ = 0;
   };
 
-  AssetOrder(std::shared_ptr<DeviceRoot> root, const DeviceLog& log)
-      : root_(std::move(root)), log_(log) {}
+  AssetOrder(FileSystem& files, const DeviceLog& log) : files_(files), log_(log) {}
 
   // Drops the cached copy: the file is read again when next needed.
   void clear() { stale_.store(true, std::memory_order_release); }
@@ -43,7 +42,7 @@ class AssetOrder {
  private:
   void read();
 
-  const std::shared_ptr<DeviceRoot> root_;
+  FileSystem& files_;
   const DeviceLog& log_;
   std::atomic<bool> stale_{true};
   Value orders_;

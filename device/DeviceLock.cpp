@@ -5,6 +5,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <fstream>
 #include <sstream>
 
 #include "device/DeviceErrors.h"
@@ -54,9 +55,28 @@ std::string contentOf(int fd) {
   }
 }
 
-ErrorPtr lockedBy(const std::string& content) {
+// The process that has the lock of an open file, as the kernel lists it; 0 when it does not say.
+std::int64_t holderOf(int fd) {
+  struct stat status;
+  if (::fstat(fd, &status) != 0) return 0;
+  const std::string inode = ":" + std::to_string(status.st_ino);
+  std::ifstream locks("/proc/locks");
+  std::string line;
+  while (std::getline(locks, line)) {
+    // "1: FLOCK  ADVISORY  READ 1234 fe:01:5678 0 EOF"
+    std::istringstream words(line);
+    std::string number, kind, mode, access, file;
+    std::int64_t pid = 0;
+    if (!(words >> number >> kind >> mode >> access >> pid >> file) || kind != "FLOCK") continue;
+    if (file.ends_with(inode) && pid > 0) return pid;
+  }
+  return 0;
+}
+
+// The holder's pid stands in the file unless it only reads.
+ErrorPtr lockedBy(int fd, const std::string& content) {
   std::int64_t pid = 0;
-  std::istringstream(content) >> pid;
+  if (!(std::istringstream(content) >> pid)) pid = holderOf(fd);
   Dictionary info;
   info.set(kErrorMessageKey,
            Value::string("another process holds the device (pid " + std::to_string(pid) + ")"));
@@ -94,7 +114,27 @@ std::unique_ptr<DeviceLock> DeviceLock::take(const std::shared_ptr<DeviceRoot>& 
   }
   if (::flock(fd.get(), LOCK_EX | LOCK_NB) != 0) {
     const int why = errno;
-    setError(error, why == EWOULDBLOCK ? lockedBy(contentOf(fd.get()))
+    setError(error, why == EWOULDBLOCK ? lockedBy(fd.get(), contentOf(fd.get()))
+                                       : systemError("cannot lock", device_paths::kLock, why));
+    return nullptr;
+  }
+  std::unique_ptr<DeviceLock> lock(new DeviceLock(std::move(fd)));
+  lock->lastState_ = stateFrom(contentOf(lock->fd_.get()));
+  return lock;
+}
+
+std::unique_ptr<DeviceLock> DeviceLock::share(const std::shared_ptr<DeviceRoot>& root,
+                                              ErrorPtr* error) {
+  UniqueFd fd;
+  const int failed = root->openFile(device_paths::kLock, O_RDONLY, &fd);
+  if (failed == ENOENT || failed == ENOTDIR) return nullptr;
+  if (failed != 0) {
+    setError(error, systemError("cannot open", device_paths::kLock, failed));
+    return nullptr;
+  }
+  if (::flock(fd.get(), LOCK_SH | LOCK_NB) != 0) {
+    const int why = errno;
+    setError(error, why == EWOULDBLOCK ? lockedBy(fd.get(), contentOf(fd.get()))
                                        : systemError("cannot lock", device_paths::kLock, why));
     return nullptr;
   }

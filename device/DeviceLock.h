@@ -29,6 +29,11 @@ class DeviceLock {
   // Null and kLocked (with "pid") when another process holds it, kIo when it cannot be had.
   static std::unique_ptr<DeviceLock> take(const std::shared_ptr<DeviceRoot>& root, ErrorPtr* error);
 
+  // The lock as one of several that only read: no process can take it meanwhile. The file is neither
+  // made nor written. Null without an error when there is none.
+  static std::unique_ptr<DeviceLock> share(const std::shared_ptr<DeviceRoot>& root,
+                                           ErrorPtr* error);
+
   // What the last holder left; null after an unclean stop.
   const std::optional<CleanState>& lastState() const { return lastState_; }
   // Writes this process's id in place of that, before the first change to the device.

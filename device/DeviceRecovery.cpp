@@ -5,7 +5,6 @@
 #include <unordered_map>
 
 #include "device/DeviceErrors.h"
-#include "device/DeviceFileSystem.h"
 #include "device/DeviceLayout.h"
 #include "device/LibrarySchema.h"
 #include "device/MediaFolders.h"
@@ -52,9 +51,9 @@ ErrorPtr DeviceRecovery::run(const std::optional<CleanState>& last) {
 }
 
 void DeviceRecovery::remove(const std::string& path) {
-  const int failed = root_->remove(path);
-  if (failed == 0 || failed == ENOENT) return;
-  store_.log().failure("a file stays behind", systemError("cannot remove", path, failed));
+  ErrorPtr error;
+  if (files_.removeItem(path, &error) || (error && error->code() == ENOENT)) return;
+  store_.log().failure("a file stays behind", error);
 }
 
 void DeviceRecovery::sweepTemporaryFiles() {
@@ -115,9 +114,8 @@ void DeviceRecovery::sweepFolder(const std::string& folder, const std::set<std::
     remove(path);
     return;
   }
-  DeviceFileSystem files(root_, false);
   std::vector<std::string> doomed;
-  files.enumerate(
+  files_.enumerate(
       path,
       [&](const FileProperties& entry) {
         if (entry.parentPath != path || !named.contains(entry.name)) doomed.push_back(entry.path);
@@ -131,9 +129,9 @@ void DeviceRecovery::sweepFolder(const std::string& folder, const std::set<std::
 
 ErrorPtr DeviceRecovery::removeRows(const std::vector<RowId>& rows) {
   if (rows.empty()) return nullptr;
-  const int failed = root_->remove(device_paths::kLastSynced);
-  if (failed != 0 && failed != ENOENT) {
-    return systemError("cannot remove", device_paths::kLastSynced, failed);
+  ErrorPtr error;
+  if (!files_.removeItem(device_paths::kLastSynced, &error) && error && error->code() != ENOENT) {
+    return systemError("cannot remove", device_paths::kLastSynced, static_cast<int>(error->code()));
   }
   store_.log().write(LogLevel::kWarning,
                      std::to_string(rows.size()) + " synced assets have lost their files");

@@ -19,8 +19,9 @@ namespace kx {
 // the opening thread, before anything else works on the device.
 class DeviceRecovery {
  public:
-  DeviceRecovery(std::shared_ptr<DeviceRoot> root, LibraryStore& store)
-      : root_(std::move(root)), store_(store) {}
+  // What is removed goes through `files`, what is looked at through `root`.
+  DeviceRecovery(std::shared_ptr<DeviceRoot> root, FileSystem& files, LibraryStore& store)
+      : root_(std::move(root)), files_(files), store_(store) {}
 
   // Null, or why the device is not to be worked on.
   [[nodiscard]] ErrorPtr run(const std::optional<CleanState>& last);
@@ -41,6 +42,7 @@ class DeviceRecovery {
   void remove(const std::string& path);
 
   const std::shared_ptr<DeviceRoot> root_;
+  FileSystem& files_;
   LibraryStore& store_;
 };
 

@@ -7,6 +7,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <array>
 #include <atomic>
 #include <cerrno>
 #include <climits>
@@ -27,6 +28,7 @@ constexpr mode_t kDirectoryMode = 0700;
 constexpr mode_t kFileMode = 0600;
 constexpr std::string_view kTemporaryPrefix = ".kxtmp-";
 constexpr std::size_t kTemporaryDigits = 16;
+constexpr std::size_t kCompareBytes = std::size_t{128} << 10;
 
 std::atomic<bool> kernelLacksOpenat2{false};
 
@@ -77,6 +79,16 @@ int writeAll(int fd, std::span<const std::uint8_t> bytes) {
   return 0;
 }
 
+int readSome(int fd, std::span<std::uint8_t> out, std::size_t* count) {
+  ssize_t got = 0;
+  do {
+    got = ::read(fd, out.data(), out.size());
+  } while (got < 0 && errno == EINTR);
+  if (got < 0) return errno;
+  *count = static_cast<std::size_t>(got);
+  return 0;
+}
+
 int readAll(int fd, std::vector<std::uint8_t>* out) {
   struct stat status;
   if (::fstat(fd, &status) != 0) return errno;
@@ -84,18 +96,32 @@ int readAll(int fd, std::vector<std::uint8_t>* out) {
   if (!S_ISREG(status.st_mode)) return EINVAL;
   out->resize(static_cast<std::size_t>(status.st_size));
   std::size_t done = 0;
-  while (true) {
-    if (done == out->size()) out->resize(done + 4096);
-    const ssize_t count = ::read(fd, out->data() + done, out->size() - done);
-    if (count < 0) {
-      if (errno == EINTR) continue;
-      return errno;
+  for (std::size_t count = 1; done < out->size() && count > 0; done += count) {
+    if (const int failed = readSome(fd, std::span(*out).subspan(done), &count); failed != 0) {
+      return failed;
     }
-    if (count == 0) break;
-    done += static_cast<std::size_t>(count);
   }
   out->resize(done);
+  // It may be longer by now. Room for that in advance would have the whole buffer moved.
+  std::array<std::uint8_t, 4096> more;
+  for (std::size_t count = 1; count > 0;) {
+    if (const int failed = readSome(fd, more, &count); failed != 0) return failed;
+    out->insert(out->end(), more.begin(), more.begin() + static_cast<std::ptrdiff_t>(count));
+  }
   return 0;
+}
+
+// Whether the file holds just these bytes. A file that cannot be read does not.
+bool holds(int fd, std::span<const std::uint8_t> bytes) {
+  std::vector<std::uint8_t> buffer(kCompareBytes);
+  for (std::size_t count = 1; count > 0; bytes = bytes.subspan(count)) {
+    if (readSome(fd, buffer, &count) != 0 || count > bytes.size() ||
+        !std::equal(buffer.begin(), buffer.begin() + static_cast<std::ptrdiff_t>(count),
+                    bytes.begin())) {
+      return false;
+    }
+  }
+  return bytes.empty();
 }
 
 }  // namespace
@@ -154,6 +180,10 @@ std::shared_ptr<DeviceRoot> DeviceRoot::open(const std::string& hostPath, bool c
   return std::shared_ptr<DeviceRoot>(new DeviceRoot(std::move(fd), real.get()));
 }
 
+std::shared_ptr<DeviceRoot> DeviceRoot::ofMissing(std::string hostPath) {
+  return std::shared_ptr<DeviceRoot>(new DeviceRoot(UniqueFd(), std::move(hostPath)));
+}
+
 int DeviceRoot::checkPath(std::string_view path) {
   if (path.size() > kPathBytes) return ENAMETOOLONG;
   if (path.empty() || path.front() != '/') return EINVAL;
@@ -173,6 +203,7 @@ int DeviceRoot::checkPath(std::string_view path) {
 
 int DeviceRoot::resolve(const std::string& path, int flags, mode_t mode, UniqueFd* out) const {
   if (const int bad = checkPath(path); bad != 0) return bad;
+  if (!fd_) return ENOENT;
   flags |= O_CLOEXEC | O_NOFOLLOW;
   if (path == "/") {
     *out = UniqueFd(::openat(fd_.get(), ".", flags, mode));
@@ -206,7 +237,10 @@ int DeviceRoot::openFile(const std::string& path, int flags, UniqueFd* out) cons
 }
 
 int DeviceRoot::status(const std::string& path, struct stat* out) const {
-  if (path == "/") return ::fstat(fd_.get(), out) == 0 ? 0 : errno;
+  if (path == "/") {
+    if (!fd_) return ENOENT;
+    return ::fstat(fd_.get(), out) == 0 ? 0 : errno;
+  }
   UniqueFd parent;
   std::string leaf;
   if (const int bad = openParent(path, &parent, &leaf); bad != 0) return bad;
@@ -245,9 +279,8 @@ int DeviceRoot::writeAtomically(const std::string& path,
   struct stat present;
   if (status(path, &present) == 0 && S_ISREG(present.st_mode) &&
       static_cast<std::size_t>(present.st_size) == bytes.size()) {
-    std::vector<std::uint8_t> old;
-    if (readFile(path, &old) == 0 && std::equal(old.begin(), old.end(), bytes.begin(), bytes.end()))
-      return 0;
+    UniqueFd old;
+    if (resolve(path, O_RDONLY | O_NONBLOCK, 0, &old) == 0 && holds(old.get(), bytes)) return 0;
   }
   const std::string temporary = temporaryName();
   UniqueFd file(::openat(parent.get(), temporary.c_str(),

@@ -44,6 +44,8 @@ class DeviceRoot {
   // Opens, or with `create` makes, the directory. Null and kMissing, kNotOurs or kIo.
   static std::shared_ptr<DeviceRoot> open(const std::string& hostPath, bool create,
                                           ErrorPtr* error);
+  // Stands for a directory that is missing: nothing is there and nothing can be made (ENOENT).
+  static std::shared_ptr<DeviceRoot> ofMissing(std::string hostPath);
 
   // Where it is on the host, without links.
   const std::string& hostPath() const { return hostPath_; }

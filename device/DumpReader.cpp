@@ -144,7 +144,8 @@ std::optional<std::string> hashOf(const DeviceRoot& root, const std::string& pat
 
 DeviceDump readDump(SqliteDatabase& database) {
   DeviceDump dump;
-  database.execute("BEGIN");
+  // One reading, also inside of a transaction that is open already.
+  database.execute("SAVEPOINT dump");
   try {
     AssetRows rows;
     readAssets(database, &dump, &rows);
@@ -153,9 +154,9 @@ DeviceDump readDump(SqliteDatabase& database) {
     dump.camera = readPending(database, "camera");
     dump.syncProgress = readPending(database, "syncProgress");
     dump.otaRestoreProgress = readPending(database, "otaRestoreProgress");
-    database.commit();
+    database.execute("RELEASE dump");
   } catch (...) {
-    database.rollback();
+    database.execute("ROLLBACK TO dump; RELEASE dump");
     throw;
   }
   return dump;

@@ -87,6 +87,11 @@ constexpr const char* kConnectionSettings =
 constexpr const char* kWriterSettings =
     "PRAGMA journal_mode=DELETE; PRAGMA synchronous=EXTRA; PRAGMA locking_mode=NORMAL;";
 
+// What changes stays in the page cache, what it was before in a journal in memory.
+constexpr const char* kPlannerSettings =
+    "PRAGMA journal_mode=MEMORY; PRAGMA synchronous=OFF; PRAGMA cache_spill=OFF; "
+    "PRAGMA locking_mode=NORMAL;";
+
 std::int64_t number(SqliteDatabase& database, const char* sql) {
   SqliteStatement statement(database, sql);
   return statement.step() ? statement.integerAt(0) : 0;
@@ -148,6 +153,54 @@ OpenedLibrary openLibraryForWriting(const std::string& hostPath, ErrorPtr* error
   } catch (const SqliteError& failure) {
     setError(error, failure.asError());
     return {};
+  }
+}
+
+namespace {
+
+std::unique_ptr<SqliteDatabase> openPlanned(const PlannedLibrary& planned) {
+  constexpr auto kAccess = SqliteDatabase::Access::kReadWrite;
+  auto database = !planned.bytes.empty()
+                      ? SqliteDatabase::ofBytes(planned.bytes)
+                      : std::make_unique<SqliteDatabase>(
+                            planned.isNew() ? ":memory:" : planned.hostPath, kAccess);
+  database->execute(kConnectionSettings);
+  return database;
+}
+
+}  // namespace
+
+OpenedLibrary openLibraryForPlanning(const PlannedLibrary& planned, ErrorPtr* error) {
+  try {
+    OpenedLibrary opened;
+    opened.database = openPlanned(planned);
+    opened.isNew = isEmpty(*opened.database);
+    if (opened.isNew) {
+      opened.database = openPlanned({});
+    } else if (ErrorPtr wrong = checkVersion(*opened.database)) {
+      setError(error, std::move(wrong));
+      return {};
+    }
+    opened.database->execute(kPlannerSettings);
+    if (opened.isNew) makeTables(*opened.database);
+    opened.database->refuseCommits();
+    opened.database->execute("BEGIN IMMEDIATE");
+    return opened;
+  } catch (const SqliteError& failure) {
+    setError(error, failure.asError());
+    return {};
+  }
+}
+
+std::unique_ptr<SqliteDatabase> openLibraryBeforePlan(const PlannedLibrary& planned,
+                                                      ErrorPtr* error) {
+  if (planned.isNew()) return nullptr;
+  if (planned.bytes.empty()) return openLibraryForReading(planned.hostPath, error).database;
+  try {
+    return openPlanned(planned);
+  } catch (const SqliteError& failure) {
+    setError(error, failure.asError());
+    return nullptr;
   }
 }
 

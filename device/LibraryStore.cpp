@@ -21,7 +21,7 @@ RowId largest(SqliteDatabase& database, const char* sql) {
 
 LibraryStore::LibraryStore(Parts parts)
     : parts_(std::move(parts)),
-      order_(parts_.root, *parts_.log),
+      order_(*parts_.files, *parts_.log),
       queue_(DispatchQueue::serial("com.veltro.photolibrary")) {
   SqliteStatement store(database(), "SELECT value FROM info WHERE key = 'store'");
   if (store.step()) storeUUID_ = store.textAt(0);
@@ -37,9 +37,13 @@ ErrorPtr LibraryStore::write(const Work& work, const LibraryContext* origin) {
   if (!failure) {
     LibraryWriter writer(database(), order_);
     try {
-      database().execute("BEGIN IMMEDIATE");
+      database().execute(parts_.planOnly ? "SAVEPOINT work" : "BEGIN IMMEDIATE");
       work(writer);
-      database().commit();
+      if (parts_.planOnly) {
+        database().execute("RELEASE work");
+      } else {
+        database().commit();
+      }
       published(writer, origin);
       return nullptr;
     } catch (const SqliteError& error) {
@@ -51,7 +55,11 @@ ErrorPtr LibraryStore::write(const Work& work, const LibraryContext* origin) {
       failure = deviceError(DeviceError::kIo, error.what());
     }
     try {
-      database().rollback();
+      if (parts_.planOnly) {
+        database().execute("ROLLBACK TO work; RELEASE work");
+      } else {
+        database().rollback();
+      }
     } catch (const SqliteError& error) {
       broken_ = error.asError();
     }

@@ -27,10 +27,12 @@ class LibraryStore {
  public:
   struct Parts {
     std::unique_ptr<SqliteDatabase> database;
-    std::shared_ptr<DeviceRoot> root;
+    FileSystem* files = nullptr;     // outlives the store
     HealthRecord* health = nullptr;  // outlives the store
     const DeviceLog* log = nullptr;  // outlives the store
     bool readOnly = false;
+    // A transaction is open that is never committed: each write is a savepoint in it.
+    bool planOnly = false;
   };
   explicit LibraryStore(Parts parts);
   ~LibraryStore();

@@ -16,7 +16,7 @@ constexpr std::uint64_t kBatchBytes = std::uint64_t{512} << 20;
 
 Quarryd::Quarryd(Parts parts)
     : parts_(std::move(parts)),
-      files_(parts_.root, false),
+      files_(*parts_.files),
       folders_(parts_.root, parts_.filesPerFolder),
       completions_(DispatchQueue::serial("com.veltro.quarryd.completions")),
       work_(DispatchQueue::serial("com.veltro.quarryd")) {}

@@ -11,12 +11,13 @@
 #include <vector>
 
 #include "device/CameraRoll.h"
-#include "device/DeviceFileSystem.h"
+#include "device/DeviceRoot.h"
 #include "device/LibraryStore.h"
 #include "device/MediaFolders.h"
 #include "device/MediaStore.h"
 #include "device/RestoreMarker.h"
 #include "platform/dispatch/Dispatch.h"
+#include "platform/files/FileSystem.h"
 #include "platform/library/KXAssetsSaver.h"
 
 namespace kx {
@@ -30,6 +31,7 @@ class Quarryd {
     std::shared_ptr<DeviceRoot> root;
     std::shared_ptr<LibraryStore> store;
     std::unique_ptr<MediaStore> media;
+    FileSystem* files = nullptr;  // for everything but media files; outlives quarryd
     std::size_t filesPerFolder = 1000;
   };
   explicit Quarryd(Parts parts);
@@ -81,7 +83,7 @@ class Quarryd {
                      const std::unordered_map<std::string, RowId>& rows);
 
   Parts parts_;
-  DeviceFileSystem files_;
+  FileSystem& files_;
   MediaFolders folders_;
   std::atomic<bool> leftFilesBehind_{false};
   std::atomic<bool> restoring_{false};

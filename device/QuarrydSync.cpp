@@ -1,4 +1,3 @@
-#include <algorithm>
 #include <cerrno>
 #include <unordered_map>
 
@@ -50,6 +49,12 @@ bool isOlder(const struct stat& status, const std::optional<Date>& date) {
   return modified - kReferenceDateSinceUnixEpoch < date->secondsSinceReference;
 }
 
+// 0, or the errno of a file operation that failed.
+int errnoOf(bool done, const ErrorPtr& error) {
+  if (done) return 0;
+  return error && error->domain() == kPosixErrorDomain ? static_cast<int>(error->code()) : EIO;
+}
+
 }  // namespace
 
 ErrorPtr Quarryd::cleanUp(const HandOver& handOver, const std::optional<Date>& before) {
@@ -71,7 +76,8 @@ ErrorPtr Quarryd::cleanUp(const HandOver& handOver, const std::optional<Date>& b
     struct stat status;
     int failed = parts_.root->status(entry->path, &status);
     if (failed == 0 && !entry->isDirectory && !isOlder(status, before)) continue;
-    if (failed == 0) failed = parts_.root->remove(entry->path);
+    ErrorPtr why;
+    if (failed == 0) failed = errnoOf(files_.removeItem(entry->path, &why), why);
     if (failed == 0 || failed == ENOENT || failed == ENOTEMPTY) continue;
     failure = systemError("cannot remove", entry->path, failed);
   }
@@ -115,24 +121,26 @@ std::optional<std::string> Quarryd::whyNotWhole(const DataPtr& snapshot) {
 
 ErrorPtr Quarryd::seal(const std::string& snapshotPath) {
   LibraryStore& store = *parts_.store;
-  std::vector<std::uint8_t> bytes;
-  if (const int failed = parts_.root->readFile(snapshotPath, &bytes); failed != 0) {
-    store.log().failure("the sync is not sealed", systemError("cannot read", snapshotPath, failed));
+  ErrorPtr error;
+  const DataPtr snapshot = files_.readFile(snapshotPath, &error);
+  if (!snapshot) {
+    store.log().failure("the sync is not sealed",
+                        systemError("cannot read", snapshotPath, errnoOf(false, error)));
     return nullptr;
   }
-  const auto snapshot = std::make_shared<const Data>(std::move(bytes));
-  std::vector<std::uint8_t> sealed;
-  if (parts_.root->readFile(device_paths::kLastSynced, &sealed) == 0 &&
-      std::equal(sealed.begin(), sealed.end(), snapshot->span().begin(), snapshot->span().end())) {
+  const DataPtr sealed = files_.readFile(device_paths::kLastSynced, nullptr);
+  if (sealed && sealed->isEqualToData(*snapshot)) {
     return nullptr;  // proved before, and nothing has been taken back since
   }
   if (const std::optional<std::string> why = whyNotWhole(snapshot)) {
     store.log().write(LogLevel::kWarning, "the sync is not sealed: " + *why);
     return nullptr;
   }
-  const int failed = parts_.root->writeAtomically(device_paths::kLastSynced, snapshot->span());
-  if (failed == 0) return nullptr;
-  const ErrorPtr failure = systemError("cannot write", device_paths::kLastSynced, failed);
+  if (files_.writeFileAtomically(device_paths::kLastSynced, snapshot->span(), &error)) {
+    return nullptr;
+  }
+  const ErrorPtr failure =
+      systemError("cannot write", device_paths::kLastSynced, errnoOf(false, error));
   store.health().noteFailure("the sync is not sealed", failure);
   return failure;
 }

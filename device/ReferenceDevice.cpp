@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <sys/resource.h>
+#include <sys/stat.h>
 #include <sys/syscall.h>
 #include <unistd.h>
 
@@ -9,6 +10,7 @@
 #include <mutex>
 #include <stdexcept>
 
+#include "device/CutOffCommit.h"
 #include "device/DeviceErrors.h"
 #include "device/DeviceFileSystem.h"
 #include "device/DeviceLayout.h"
@@ -20,6 +22,8 @@
 #include "device/HealthRecord.h"
 #include "device/KernelMemoryPressure.h"
 #include "device/LibrarySchema.h"
+#include "device/OverlayFileSystem.h"
+#include "device/PlannedMediaStore.h"
 #include "device/Quarryd.h"
 #include "device/StoreAdmin.h"
 #include "device/SystemClock.h"
@@ -77,6 +81,17 @@ class RestoreFiles : public QBManager {
   const std::vector<QBFile> files_;
 };
 
+// 0 when the directory could be made where it is missing, else the errno that this would give.
+int whyNotMakeable(std::string path) {
+  while (path.size() > 1 && path.back() == '/') path.pop_back();
+  const std::size_t slash = path.rfind('/');
+  const std::string parent = slash == std::string::npos ? "." : path.substr(0, slash + 1);
+  struct stat status;
+  if (::stat(parent.c_str(), &status) != 0) return errno;
+  if (!S_ISDIR(status.st_mode)) return ENOTDIR;
+  return ::access(parent.c_str(), W_OK | X_OK) == 0 ? 0 : errno;
+}
+
 class StoreDevice : public ReferenceDevice, public Platform {
  public:
   explicit StoreDevice(const DeviceOptions& options)
@@ -96,6 +111,7 @@ class StoreDevice : public ReferenceDevice, public Platform {
   void setRestoreFiles(std::optional<std::vector<QBFile>> files) override;
   void drain() override;
   DeviceDump dump(bool hash, ErrorPtr* error) override;
+  LibraryDifference difference(const LibraryChanges& changes, ErrorPtr* error) override;
 
   // Platform
   Clock& clock() override { return options_.clock != nullptr ? *options_.clock : systemClock_; }
@@ -112,9 +128,12 @@ class StoreDevice : public ReferenceDevice, public Platform {
   std::string mobileHomeDirectory() override { return device_paths::kMobileHome; }
 
  private:
+  ErrorPtr openRoot();
   ErrorPtr openForReading();
   ErrorPtr openForWriting();
+  ErrorPtr openForPlanning();
   ErrorPtr makeTree();
+  void startQuarryd(std::unique_ptr<MediaStore> media);
   void makeStore(OpenedLibrary library);
 
   const DeviceOptions options_;
@@ -124,7 +143,10 @@ class StoreDevice : public ReferenceDevice, public Platform {
   std::shared_ptr<DeviceRoot> root_;
   std::unique_ptr<DeviceLock> lock_;
   std::shared_ptr<LibraryStore> store_;
-  std::unique_ptr<DeviceFileSystem> files_;
+  std::unique_ptr<DeviceFileSystem> realFiles_;
+  std::unique_ptr<OverlayFileSystem> plannedFiles_;  // of a device for planning
+  FileSystem* files_ = nullptr;                      // the ones in use
+  std::unique_ptr<SqliteDatabase> before_;           // of a device for planning that is there
   std::unique_ptr<DeviceLibraryFramework> framework_;
   std::unique_ptr<StoreAdmin> admin_;
   std::unique_ptr<Quarryd> quarryd_;
@@ -135,13 +157,34 @@ class StoreDevice : public ReferenceDevice, public Platform {
   std::vector<QBFile> restoreFiles_;
 };
 
-ErrorPtr StoreDevice::start() {
+ErrorPtr StoreDevice::openRoot() {
   ErrorPtr error;
-  root_ = DeviceRoot::open(options_.root, options_.create && !options_.readOnly, &error);
-  if (!root_) return error;
-  files_ = std::make_unique<DeviceFileSystem>(root_, options_.readOnly);
+  const bool create = options_.create && !options_.readOnly && !options_.planOnly;
+  root_ = DeviceRoot::open(options_.root, create, &error);
+  if (root_ || !options_.planOnly) return error;
+  if (error->code() != static_cast<std::int64_t>(DeviceError::kMissing)) return error;
+  if (const int refused = whyNotMakeable(options_.root); refused != 0) {
+    return systemError("cannot make", options_.root, refused);
+  }
+  root_ = DeviceRoot::ofMissing(options_.root);
+  return nullptr;
+}
+
+ErrorPtr StoreDevice::start() {
+  if (ErrorPtr failed = openRoot()) return failed;
+  const bool reads = options_.readOnly || options_.planOnly;
+  realFiles_ = std::make_unique<DeviceFileSystem>(root_, reads);
+  files_ = realFiles_.get();
+  if (options_.planOnly) {
+    plannedFiles_ = std::make_unique<OverlayFileSystem>(*realFiles_);
+    files_ = plannedFiles_.get();
+  }
   globalQueue_ = DispatchQueue::concurrent("com.veltro.global.default", kGlobalQueueThreads);
-  if (ErrorPtr failed = options_.readOnly ? openForReading() : openForWriting()) return failed;
+  if (ErrorPtr failed = options_.planOnly   ? openForPlanning()
+                        : options_.readOnly ? openForReading()
+                                            : openForWriting()) {
+    return failed;
+  }
   framework_ = std::make_unique<DeviceLibraryFramework>(store_);
   admin_ = std::make_unique<StoreAdmin>(root_, store_);
   saver_ = std::make_unique<DeviceSaver>(quarryd_.get(), globalQueue_);
@@ -168,8 +211,9 @@ ErrorPtr StoreDevice::makeTree() {
   using namespace device_paths;
   for (const char* path : {kTemporary, kDcim, kPhotoData, kCaches, kCascades, kSyncedAssets,
                            kFaceThumbnails, kSync, kStaging}) {
-    if (const int failed = root_->makeDirectories(path); failed != 0) {
-      return systemError("cannot make", path, failed);
+    ErrorPtr error;
+    if (!files_->createDirectoryWithIntermediates(path, &error)) {
+      return systemError("cannot make", path, static_cast<int>(error->code()));
     }
   }
   return nullptr;
@@ -205,23 +249,65 @@ ErrorPtr StoreDevice::openForWriting() {
   }
   makeStore(std::move(library));
   // The store is used by this thread alone until its queue gets its first block.
-  const std::optional<CleanState> last =
-      options_.beforeLibrary ? std::nullopt : lock_->lastState();
-  if (ErrorPtr failed = DeviceRecovery(root_, *store_).run(last)) return failed;
+  const std::optional<CleanState> last = options_.beforeLibrary ? std::nullopt : lock_->lastState();
+  if (ErrorPtr failed = DeviceRecovery(root_, *files_, *store_).run(last)) return failed;
   health_.reset();
-  std::unique_ptr<MediaStore> media = std::make_unique<FileMediaStore>(root_);
+  startQuarryd(std::make_unique<FileMediaStore>(root_));
+  return nullptr;
+}
+
+ErrorPtr StoreDevice::openForPlanning() {
+  ErrorPtr error;
+  lock_ = DeviceLock::share(root_, &error);
+  if (error) return error;
+  if (ErrorPtr failed = makeTree()) return failed;
+  struct stat status;
+  const int present = root_->status(device_paths::kDatabase, &status);
+  if (present != 0 && present != ENOENT && present != ENOTDIR) {
+    return systemError("cannot open", device_paths::kDatabase, present);
+  }
+  PlannedLibrary planned;
+  if (present == 0 && hasCutOffCommit(*root_)) {
+    if (const int failed = readBeforeCutOffCommit(*root_, &planned.bytes); failed != 0) {
+      return systemError("cannot read", device_paths::kDatabase, failed);
+    }
+  } else if (present == 0) {
+    planned.hostPath = root_->hostPath() + device_paths::kDatabase;
+  }
+  OpenedLibrary library = openLibraryForPlanning(planned, &error);
+  if (!library.database) return error;
+  if (library.isNew) {
+    files_->removeItem(device_paths::kLastSynced, nullptr);
+  } else {
+    before_ = openLibraryBeforePlan(planned, &error);
+    if (!before_) return error;
+  }
+  makeStore(std::move(library));
+  const std::optional<CleanState> last = lock_ ? lock_->lastState() : std::nullopt;
+  if (ErrorPtr failed = DeviceRecovery(root_, *files_, *store_).run(last)) return failed;
+  health_.reset();
+  startQuarryd(std::make_unique<PlannedMediaStore>());
+  return nullptr;
+}
+
+void StoreDevice::startQuarryd(std::unique_ptr<MediaStore> media) {
   if (options_.decorateMedia) media = options_.decorateMedia(std::move(media));
-  quarryd_ = std::make_unique<Quarryd>(
-      Quarryd::Parts{root_, store_, std::move(media), options_.filesPerFolder});
+  Quarryd::Parts parts;
+  parts.root = root_;
+  parts.store = store_;
+  parts.media = std::move(media);
+  parts.files = files_;
+  parts.filesPerFolder = options_.filesPerFolder;
+  quarryd_ = std::make_unique<Quarryd>(std::move(parts));
   store_->setFileReleaser(
       [this](std::vector<std::string> paths) { quarryd_->removeFiles(std::move(paths)); });
-  return nullptr;
 }
 
 void StoreDevice::makeStore(OpenedLibrary library) {
   LibraryStore::Parts parts;
   parts.database = std::move(library.database);
-  parts.root = root_;
+  parts.files = files_;
+  parts.planOnly = options_.planOnly;
   parts.health = &health_;
   parts.log = &log_;
   parts.readOnly = options_.readOnly;
@@ -270,6 +356,20 @@ DeviceDump StoreDevice::dump(bool hash, ErrorPtr* error) {
   return dump;
 }
 
+LibraryDifference StoreDevice::difference(const LibraryChanges& changes, ErrorPtr* error) {
+  LibraryDifference difference;
+  ErrorPtr failure;
+  store_->queue().sync([&] {
+    try {
+      difference = differenceOf(before_.get(), store_->database(), changes);
+    } catch (const SqliteError& problem) {
+      failure = problem.asError();
+    }
+  });
+  if (failure) setError(error, failure);
+  return difference;
+}
+
 StoreDevice::~StoreDevice() {
   if (!store_) return;
   drain();
@@ -284,7 +384,7 @@ StoreDevice::~StoreDevice() {
   // Libraries that are still held keep the store, and with it the database, open.
   const bool lastUser = store_.use_count() == 1;
   store_.reset();
-  if (!lock_ || filesLeft || !lastUser) return;
+  if (!lock_ || filesLeft || !lastUser || options_.planOnly) return;
   if (const int failed = lock_->markClean(CleanState::of(*root_)); failed != 0) {
     log_.failure("the device is not marked as clean",
                  systemError("cannot write", device_paths::kLock, failed));

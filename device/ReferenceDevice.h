@@ -11,6 +11,7 @@
 
 #include "device/DeviceAdmin.h"
 #include "device/DeviceRoot.h"
+#include "device/LibraryDifference.h"
 #include "device/MediaStore.h"
 #include "platform/Platform.h"
 
@@ -88,6 +89,10 @@ struct DeviceOptions {
   std::string root;       // the directory that stands for the device's root
   bool create = false;    // make it, and the library, when missing
   bool readOnly = false;  // for status, dump and metrics: takes no lock, changes nothing
+  // The device as it would be: a directory that is missing stands for an empty one, every change to
+  // library and files is kept in memory and forgotten, imports take no file. Nobody can write
+  // meanwhile.
+  bool planOnly = false;
   LogSinks logs;
   Clock* clock = nullptr;             // null: the real one; must outlive the device
   MediaStoreDecorator decorateMedia;  // null: the media store as it is
@@ -123,6 +128,8 @@ class ReferenceDevice {
   // What the backup manager answers from now on: these files while a restore brings them back (no
   // sync is sealed meanwhile), an empty list for nothing, as in the beginning.
   virtual void setRestoreFiles(std::optional<std::vector<QBFile>> files) = 0;
+  // What sets the library apart from what the device really holds; of a device for planning alone.
+  virtual LibraryDifference difference(const LibraryChanges& changes, ErrorPtr* error) = 0;
   // Waits until quarryd and the library's queue have nothing to do.
   virtual void drain() = 0;
   // One consistent reading; works in a read-only device too. `hash` adds SHA-256 of the files.

@@ -2,6 +2,7 @@
 
 #include <sys/statvfs.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cmath>
 #include <limits>
@@ -69,6 +70,19 @@ SqliteDatabase::SqliteDatabase(const std::string& path, Access access) {
   sqlite3_limit(connection_, SQLITE_LIMIT_ATTACHED, 0);
 }
 
+std::unique_ptr<SqliteDatabase> SqliteDatabase::ofBytes(std::span<const std::uint8_t> bytes) {
+  auto database = std::make_unique<SqliteDatabase>(":memory:", Access::kReadWrite);
+  const auto size = static_cast<sqlite3_int64>(bytes.size());
+  auto* copy = static_cast<unsigned char*>(sqlite3_malloc64(bytes.size() + 1));
+  if (copy == nullptr) throw SqliteError(SQLITE_NOMEM, "no memory for the library");
+  std::copy(bytes.begin(), bytes.end(), copy);
+  const int code =
+      sqlite3_deserialize(database->connection_, "main", copy, size, size,
+                          SQLITE_DESERIALIZE_FREEONCLOSE | SQLITE_DESERIALIZE_RESIZEABLE);
+  if (code != SQLITE_OK) database->fail(code, "the library cannot be read");
+  return database;
+}
+
 SqliteDatabase::~SqliteDatabase() {
   for (const auto& [sql, statement] : statements_) sqlite3_finalize(statement);
   sqlite3_close(connection_);
@@ -119,6 +133,11 @@ void SqliteDatabase::copyTo(SqliteDatabase& target, const std::function<bool()>&
   const int ended = sqlite3_backup_finish(copy);
   if (code == SQLITE_DONE && ended == SQLITE_OK) return;
   target.fail(ended != SQLITE_OK ? ended : code, kDoing);
+}
+
+void SqliteDatabase::refuseCommits() {
+  sqlite3_commit_hook(
+      connection_, [](void*) { return 1; }, nullptr);
 }
 
 std::uint64_t SqliteDatabase::rowsWritten() const {

@@ -6,6 +6,7 @@
 #include <functional>
 #include <memory>
 #include <optional>
+#include <span>
 #include <stdexcept>
 #include <string>
 #include <string_view>
@@ -38,6 +39,8 @@ class SqliteDatabase {
   enum class Access { kCreate, kReadWrite, kReadOnly };
   // `path`: an absolute host path without links (none is followed).
   SqliteDatabase(const std::string& path, Access access);
+  // A database in memory that begins as these bytes of a database file say.
+  static std::unique_ptr<SqliteDatabase> ofBytes(std::span<const std::uint8_t> bytes);
   ~SqliteDatabase();
   SqliteDatabase(const SqliteDatabase&) = delete;
   SqliteDatabase& operator=(const SqliteDatabase&) = delete;
@@ -47,6 +50,8 @@ class SqliteDatabase {
   // Commits, again and again for a minute while readers of other processes are in the way.
   void commit();
   void rollback();
+  // From now on no commit succeeds: whoever tries one gets an error and a rollback.
+  void refuseCommits();
   // Puts all of this database, as of one moment, in the place of all that is in the target, as one
   // transaction of the target: SQLite's online backup. Good while others read either of them. Asked
   // between steps, `goOn` ends it (SQLITE_INTERRUPT) by saying no.

@@ -38,11 +38,13 @@ class FakeDevice : public ReferenceDevice {
   DeviceRoot& root() override { throw std::logic_error("no root"); }
   void setRestoreFiles(std::optional<std::vector<QBFile>>) override {}
   void drain() override { memory.saver.drain(); }
-  DeviceDump dump(bool, ErrorPtr*) override { return {}; }
+  DeviceDump dump(bool, ErrorPtr*) override { return content; }
+  LibraryDifference difference(const LibraryChanges&, ErrorPtr*) override { return {}; }
 
   TestPlatform memory;
   Health noted;
   LibraryChanges changes;
+  DeviceDump content;  // what dump gives
 };
 
 }  // namespace kx::test

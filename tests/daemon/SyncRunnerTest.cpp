@@ -348,6 +348,42 @@ TEST_F(SyncRunnerTest, FilesThatCannotFitChangeNothing) {
   expectUntouched(before);
 }
 
+TEST_F(SyncRunnerTest, SaysWhatIsNeededFreeAndMissingForPeopleToo) {
+  link.sizes["B"] = std::int64_t{60} << 30;
+  options.reserveBytes = std::uint64_t{1} << 62;
+  const std::string message = run().error->message();
+  EXPECT_THAT(message, HasSubstr("64424509450 bytes needed (64.4 GB)"));
+  EXPECT_THAT(message, HasSubstr("4611686018427387904 bytes kept free (4.6 EB)"));
+  EXPECT_THAT(message, testing::ContainsRegex("[0-9]+ bytes free"));
+  EXPECT_THAT(message, testing::ContainsRegex("[0-9]+ bytes missing \\("));
+}
+
+TEST_F(SyncRunnerTest, FilesThatGoMakeRoomAndChangedOnesAreWarnedOf) {
+  seedAssets(1);
+  DeviceDump::Asset gone;
+  gone.uuid = "old0";
+  gone.savedAssetType = kKXSavedAssetTypeSynced;
+  gone.size = std::int64_t{1} << 62;
+  link.sizes["B"] = std::int64_t{60} << 30;
+  options.reserveBytes = std::uint64_t{1} << 61;
+  EXPECT_EQ(run().exitCode, kExitNoSpace);
+  device.content.assets = {gone};
+  EXPECT_EQ(run().exitCode, kExitDone);
+  // What a reconcile asks for beyond the new files is told of before the first is moved.
+  ask({"A"});
+  link.sizes["A"] = std::int64_t{1} << 60;
+  std::vector<std::string> notices;
+  options.notice = [&](const std::string& text) {
+    EXPECT_TRUE(link.opened.empty());
+    notices.push_back(text);
+  };
+  link.opened.clear();
+  run();
+  ASSERT_EQ(notices.size(), 1U);
+  EXPECT_THAT(notices[0], HasSubstr("1152921504606846976 bytes needed (1.2 EB)"));
+  EXPECT_FALSE(link.opened.empty());
+}
+
 TEST_F(SyncRunnerTest, NothingNewNeedsNoRoom) {
   seedAssets(1, "A");
   host({"A0"});
@@ -393,6 +429,25 @@ INSTANTIATE_TEST_SUITE_P(Counts, GuardTest,
                            return "Synced" + std::to_string(row.param.synced) + "Listed" +
                                   std::to_string(row.param.listed);
                          });
+
+TEST_F(SyncRunnerTest, TheGuardSaysHowManyOfWhichKindAndWhy) {
+  seedAssets(60);
+  EXPECT_THAT(run().error->message(),
+              testing::AllOf(HasSubstr("60 of 60 synced photos would be deleted, more than half"),
+                             HasSubstr("more than 50"), HasSubstr("--allow-deletes lets it pass")));
+  for (int i = 0; i < 61; ++i) {
+    DeviceDump::Asset asset;
+    asset.uuid = "old" + std::to_string(i);
+    asset.savedAssetType = i < 60 ? kKXSavedAssetTypeSynced : 0;
+    asset.isVideo = i < 1;
+    device.content.assets.push_back(asset);
+  }
+  EXPECT_THAT(run().error->message(), HasSubstr("would be deleted (59 photos, 1 video), more"));
+  host({});
+  EXPECT_THAT(run().error->message(),
+              HasSubstr("lists no photo at all, so all 60 synced ones would be deleted "
+                        "(59 photos, 1 video); --allow-deletes"));
+}
 
 TEST_F(SyncRunnerTest, TheSealedSnapshotItselfIsNotComparedAgain) {
   seedAssets(60);
