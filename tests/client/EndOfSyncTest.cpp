@@ -1,3 +1,6 @@
+#include <algorithm>
+#include <thread>
+
 #include "tests/client/ClientFixture.h"
 
 namespace kx {
@@ -64,6 +67,14 @@ TEST_F(EndOfSyncTest, TheCleanUpLogsItsStepsInOrder) {
   platform.captured.clear();
   client->assetTransferEndedWithSuccess(true);
   Texts onPluginQueue = platform.captured.texts();
+  const auto place = [all = onPluginQueue](const char* text) {
+    return std::find(all.begin(), all.end(), text) - all.begin();
+  };
+  // Each step waits for the library's work of the one before.
+  EXPECT_LT(place("_saveOutstandingSyncJobs: completed call to saveSyncedAssets"),
+            place("_clearPendingCounts: _syncRequested=YES"));
+  EXPECT_LT(place("_clearPendingCounts completed"), place("_clearEmptySyncAlbums completed"));
+  EXPECT_LT(place("_clearEmptySyncAlbums completed"), place("Done uninitializing library."));
   // What other queues log may come between.
   for (const char* text :
        {"_saveOutstandingSyncJobs: completed call to saveSyncedAssets",
@@ -186,6 +197,29 @@ TEST_F(EndOfSyncTest, TheEndWaitsForTheBatchInFlight) {
   // Nothing had to be drained: the assets are there when the call returns.
   EXPECT_EQ(assets(), "A B");
   EXPECT_TRUE(platform.library.blockExceptions().empty());
+}
+
+TEST_F(EndOfSyncTest, TheRemoteCleanUpIsAskedForAfterTheLibrarysEarlierWork) {
+  ASSERT_TRUE(prepare());
+  ASSERT_TRUE(reconcile(plainSnapshot()));
+  arriveAll();
+  platform.captured.clear();
+  const DispatchGroupPtr group = client->libraryGroup();
+  group->enter();
+  std::thread work([&] {
+    while (!logged(LogLevel::kInfo, "_cleanupAfterSyncOrRestore: _syncRequested=YES")) {
+      std::this_thread::yield();
+    }
+    // Long enough for an end that does not wait to be past its clean-up.
+    for (int i = 0; i < 100; ++i) platform.library.perform([](InMemoryLibraryState&) {});
+    KX_LOG("Test", "work", LogLevel::kInfo, "earlier work is done");
+    group->leave();
+  });
+  client->assetTransferEndedWithSuccess(true);
+  work.join();
+  const Texts texts = platform.captured.texts();
+  EXPECT_LT(std::find(texts.begin(), texts.end(), "earlier work is done"),
+            std::find(texts.begin(), texts.end(), "_enqueueRemoteSyncCleanupJob"));
 }
 
 TEST_F(EndOfSyncTest, ASecondSyncDoesNothing) {

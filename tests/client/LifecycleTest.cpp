@@ -178,6 +178,7 @@ TEST_F(LifecycleTest, ClearingDropsThePerSyncFieldsAndKeepsTheOthers) {
   ASSERT_TRUE(
       reconcile(SnapshotBuilder().asset("A").album("AL", "Trip", {"A"}).masterAlbum({"A"})));
   client->_enqueueSyncSaveJob(std::make_shared<KXSyncSaveJob>());
+  client->_startListeningToMemoryPressureEvents();
   platform.fakeClock.advance(5);
   const double saved = client->lastSyncJobsSaveTime();
   EXPECT_NE(client->masterAlbum(), nullptr);
@@ -195,6 +196,8 @@ TEST_F(LifecycleTest, ClearingDropsThePerSyncFieldsAndKeepsTheOthers) {
   EXPECT_FALSE(client->restoreContext().has_value());
   EXPECT_FALSE(client->outstandingSyncJobs().has_value());
   EXPECT_FALSE(client->syncRequested());
+  EXPECT_FALSE(client->isListeningToMemoryPressure());
+  EXPECT_EQ(platform.memoryPressure.listening(), 0U);
   EXPECT_TRUE(client->isResync());
   EXPECT_EQ(client->lastSyncJobsSaveTime(), saved);
   EXPECT_NE(client->library(), nullptr);

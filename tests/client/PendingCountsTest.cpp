@@ -1,3 +1,5 @@
+#include <thread>
+
 #include "tests/client/ClientFixture.h"
 
 namespace kx {
@@ -162,6 +164,29 @@ TEST_F(PendingCountsTest, EmptyAlbumsAndEventsGoFaceAlbumsStay) {
   for (const std::string& text : loggedBy("_clearEmptySyncAlbums")) {
     EXPECT_TRUE(logged(LogLevel::kInfo, text));
   }
+}
+
+TEST_F(PendingCountsTest, EmptyAlbumsAreLookedForAfterTheLibrarysEarlierWork) {
+  addSynced("A");
+  addAlbum("AL", "Trip");
+  client->_initializeLibrary();
+  const KXPhotoLibraryPtr library = client->library();
+  const DispatchGroupPtr group = client->libraryGroup();
+  group->enter();
+  std::thread work([&] {
+    const auto own = std::make_shared<DispatchGroup>();
+    library->withDispatchGroupPerformTransaction(own, [&] {
+      const KXGenericAlbumPtr album = library->albumWithUUID("AL");
+      ASSERT_NE(album, nullptr);
+      album->asManagedAlbum()->addAssetUsingTesselAlbumOrder(library->assetWithUUID("A"));
+    });
+    own->wait();
+    group->leave();
+  });
+  client->_clearEmptySyncAlbums();
+  work.join();
+  group->wait();
+  EXPECT_EQ(albums(), "Trip[A]");
 }
 
 TEST_F(PendingCountsTest, AFailedFetchOfEmptyAlbumsIsIgnored) {
