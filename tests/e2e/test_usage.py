@@ -6,7 +6,8 @@ import unittest
 
 from harness import EndToEnd, OrdinaryUser, asset, jpeg, kxsync, snapshot, tree_hash, uid
 
-COMMANDS = ("sync", "status", "dump", "show", "snapshot")
+COMMANDS = ("sync", "plan", "status", "dump", "show", "snapshot", "restore", "backup",
+            "metrics", "backup-paths")
 
 
 class Help(EndToEnd):
@@ -34,12 +35,12 @@ class WrongUsage(EndToEnd):
     TABLE = (
         ([], "a command is missing"),
         (["frobnicate"], '"frobnicate"'),
-        (["plan", "a", "b"], '"plan"'),
+        (["plan", "a"], "DEVICE"),
         (["--frobnicate"], "--frobnicate"),
         (["sync"], "HOST"),
         (["sync", "a"], "DEVICE"),
         (["sync", "a", "b", "c"], "c"),
-        (["sync", "a", "b", "--dry-run"], "--dry-run"),
+        (["sync", "a", "b", "--dry"], "--dry"),
         (["sync", "a", "b", "--log-level", "loud"], "loud"),
         (["sync", "a", "b", "--log-level"], "--log-level"),
         (["sync", "a", "b", "--timezone", "CEST"], "CEST"),
@@ -50,6 +51,16 @@ class WrongUsage(EndToEnd):
         (["dump"], "DEVICE"),
         (["show"], "FILE"),
         (["snapshot", "a"], "HOST"),
+        (["backup"], "DEVICE"),
+        (["backup", "a"], "BACKUP"),
+        (["backup", "a", "a"], "same directory"),
+        (["backup", "a", "a/b"], "BACKUP lies inside DEVICE"),
+        (["backup", "a", "--verify", "b"], "--verify"),
+        (["backup", "--verify"], "--verify"),
+        (["backup", "--verify", "a", "--with-library"], "--verify"),
+        (["metrics"], "DEVICE"),
+        (["metrics", "a", "b"], "b"),
+        (["backup-paths"], "DEVICE"),
     )
 
     def setUp(self):
@@ -66,7 +77,7 @@ class WrongUsage(EndToEnd):
                 self.assertEqual(len(lines), 2, str(done))
                 self.assertTrue(lines[0].startswith("kxsync: "), str(done))
                 self.assertIn(word, lines[0])
-                self.assertRegex(lines[1], r'^Try "kxsync( \w+)? --help"\.$')
+                self.assertRegex(lines[1], r'^Try "kxsync( [\w-]+)? --help"\.$')
         self.assertEqual(sorted(os.listdir(self.top)), ["a"], "nothing was made")
 
     def test_wrong_usage_is_json_too_when_asked_for(self):
