@@ -51,12 +51,27 @@ const OverlayFileSystem::Entry* OverlayFileSystem::find(const std::string& path)
   return found == entries_.end() ? nullptr : &found->second;
 }
 
+int OverlayFileSystem::blocked(const std::string& path) const {
+  bool isInNewDirectory = false;
+  for (std::size_t slash = path.find('/', 1); slash != std::string::npos;
+       slash = path.find('/', slash + 1)) {
+    const Entry* entry = find(path.substr(0, slash));
+    if (entry == nullptr) continue;
+    if (entry->kind == Kind::kFile) return ENOTDIR;
+    if (entry->kind == Kind::kRemoved) return ENOENT;
+    isInNewDirectory = true;
+  }
+  return isInNewDirectory && find(path) == nullptr ? ENOENT : 0;
+}
+
 bool OverlayFileSystem::exists(const std::string& path) const {
+  if (blocked(path) != 0) return false;
   const Entry* entry = find(path);
   return entry != nullptr ? entry->kind != Kind::kRemoved : below_.fileExists(path);
 }
 
 int OverlayFileSystem::directoryError(const std::string& path) const {
+  if (const int end = blocked(path); end != 0) return end;
   if (const Entry* entry = find(path)) {
     if (entry->kind == Kind::kRemoved) return ENOENT;
     return entry->kind == Kind::kDirectory ? 0 : ENOTDIR;
@@ -66,8 +81,7 @@ int OverlayFileSystem::directoryError(const std::string& path) const {
   return error ? codeOf(error) : 0;
 }
 
-// What lies below was empty when a directory was removed, or each of it was removed before: a
-// removed entry of its own hides each of them.
+// What lay below a directory was removed before it was: a removed entry of its own hides each.
 int OverlayFileSystem::list(const std::string& path, std::vector<std::string>* names) const {
   if (const int failed = directoryError(path); failed != 0) return failed;
   std::set<std::string> found;
@@ -105,6 +119,7 @@ DataPtr OverlayFileSystem::keep(std::span<const std::uint8_t> bytes) const {
 }
 
 std::string OverlayFileSystem::identifierOf(const std::string& path) const {
+  if (blocked(path) != 0) return {};
   const Entry* entry = find(path);
   return entry != nullptr ? entry->identifier : below_.resourceIdentifier(path);
 }
@@ -118,6 +133,10 @@ bool OverlayFileSystem::fileExists(const std::string& path) {
 DataPtr OverlayFileSystem::readFile(const std::string& path, ErrorPtr* error) {
   {
     const std::lock_guard<std::mutex> lock(mutex_);
+    if (const int end = blocked(path); end != 0) {
+      done(path, end, error);
+      return nullptr;
+    }
     if (const Entry* entry = find(path)) {
       if (entry->kind == Kind::kFile) return entry->bytes;
       done(path, entry->kind == Kind::kRemoved ? ENOENT : EISDIR, error);
@@ -252,6 +271,10 @@ std::string OverlayFileSystem::resourceIdentifier(const std::string& path) {
 // Of something new that of the nearest directory that is really there.
 std::uint32_t OverlayFileSystem::blockSize(const std::string& path, ErrorPtr* error) {
   const std::lock_guard<std::mutex> lock(mutex_);
+  if (const int end = blocked(path); end != 0) {
+    done(path, end, error);
+    return 0;
+  }
   if (DeviceRoot::checkPath(path) == 0 && find(path) != nullptr) {
     if (!exists(path)) {
       done(path, ENOENT, error);
@@ -267,7 +290,7 @@ std::uint32_t OverlayFileSystem::blockSize(const std::string& path, ErrorPtr* er
 FileSystem::LockAttempt OverlayFileSystem::tryLock(const std::string& path) {
   {
     const std::lock_guard<std::mutex> lock(mutex_);
-    if (find(path) != nullptr) {
+    if (find(path) != nullptr || blocked(path) != 0) {
       LockAttempt attempt;
       if (!exists(path)) return attempt;
       const std::lock_guard<std::mutex> tableLock(locks_->mutex);

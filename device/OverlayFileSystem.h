@@ -48,6 +48,8 @@ class OverlayFileSystem final : public FileSystem {
 
   // All under mutex_.
   const Entry* find(const std::string& path) const;
+  // 0, or the errno with which a path ends at what was made or removed on its way.
+  int blocked(const std::string& path) const;
   bool exists(const std::string& path) const;
   // 0 for a directory, else the errno that a real one's absence gives.
   int directoryError(const std::string& path) const;
