@@ -250,14 +250,13 @@ int BackupFolder::removeOld(const BackupManifest& manifest) {
 int BackupFolder::removeOne(const std::string& path) {
   struct stat status;
   int failed = root_->status(path, &status);
-  if (failed == ENOENT || failed == ENOTDIR) return 0;
-  if (failed != 0) return failed;
-  if (S_ISDIR(status.st_mode)) return 0;  // something else has taken the name
-  failed = root_->remove(path);
-  if (failed != 0) return failed;
+  // When something else has taken the name, that stays.
+  if (failed == 0 && !S_ISDIR(status.st_mode)) failed = root_->remove(path);
+  if (failed != 0 && failed != ENOENT && failed != ENOTDIR) return failed;
   std::string directory = parentOf(path);
   touched_.insert(directory);
-  while (directory != "/" && root_->remove(directory) == 0) {
+  while (directory != "/" && root_->status(directory, &status) == 0 && S_ISDIR(status.st_mode) &&
+         root_->remove(directory) == 0) {
     touched_.erase(directory);
     directory = parentOf(directory);
     touched_.insert(directory);
@@ -313,7 +312,7 @@ int BackupFolder::syncTouched() {
   if (touched_.size() > kFewDirectories) return syncAll();
   for (const std::string& directory : touched_) {
     const int failed = root_->syncDirectory(directory);
-    if (failed != 0 && failed != ENOENT) return failed;
+    if (failed != 0 && failed != ENOENT && failed != ENOTDIR) return failed;
   }
   return 0;
 }
