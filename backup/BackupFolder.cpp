@@ -319,6 +319,8 @@ int BackupFolder::syncTouched() {
 
 int BackupFolder::clearIncoming(const std::set<std::string, std::less<>>& kept) {
   preparedDirectory_.clear();
+  struct stat status;
+  if (root_->status(kIncoming, &status) == ENOENT) return 0;
   const int failed = walkTree(*root_, kIncoming, [&](const std::string& path, bool isDirectory) {
     if (path == kJournal || kept.contains(path)) return 0;
     const int refused = root_->remove(path);

@@ -243,7 +243,7 @@ void addBackupCommand(CLI::App& app, Action& chosen) {
   command->add_flag("--with-library", arguments->withLibrary,
                     "Take the library's database too: albums and dates come back as they are");
   command->add_flag("--allow-deletes", arguments->allowDeletes,
-                    "Let this backup lose files that most of the old one consists of");
+                    "Let this backup lose most of the files of the old one");
   command->footer(kExamples);
   command->callback([arguments, &chosen] {
     chosen = [arguments](Context& context) { return run(context, *arguments); };

