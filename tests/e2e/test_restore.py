@@ -8,6 +8,7 @@ import signal
 import sqlite3
 import stat
 import subprocess
+import tempfile
 import time
 import unittest
 
@@ -112,6 +113,12 @@ class ALargeDevice(Restores):
 
     def setUp(self):
         super().setUp()
+        # Thousands of state files are made durable one by one: memory takes that faster.
+        if os.access("/dev/shm", os.W_OK):
+            self.top = tempfile.mkdtemp(prefix="kxsync-test-", dir="/dev/shm")
+            self.addCleanup(shutil.rmtree, self.top, ignore_errors=True)
+        self.host, self.device = self.path("host"), self.path("device")
+        self.backup = self.path("backup")
         self.make_camera(CAMERA_ASSETS, albums=[("Best of", range(0, 2000, 100)),
                                                 ("Empty", []), ("Last", [1999, 5, 700])])
         self.members = [uid(f"synced-{number}") for number in range(SYNCED)]
@@ -138,7 +145,6 @@ class ALargeDevice(Restores):
             self.assertEqual(set(dump["assets"]), own)
         else:
             self.assertEqual(len(dump["assets"]), CAMERA_ASSETS)
-        self.assertEqual(self.restore()["outcome"], "nothing")
         synced = self.sync()
         self.assertEqual(synced["imported"], SYNCED)
         self.assertEqual(self.own_albums(), albums)
@@ -154,12 +160,13 @@ class ALargeDevice(Restores):
         self.assertEqual(self.camera_hashes(other), files)
         self.assertEqual(self.own_albums(other), albums)
         self.assert_at_rest(other)
+        self.assertEqual(self.restore(device=other)["outcome"], "nothing")
         # Photos taken since stay, whatever is restored.
         self.make_camera(20, first=CAMERA_ASSETS)
         os.remove(os.path.join(self.device, DCIM, camera_name(3) + ".JPG"))
         result = self.restore()
         self.assertEqual((result["outcome"], result["restored"]), ("restored", 1))
-        self.assertEqual(len(self.camera_hashes()), len(files) + 20)
+        self.assertEqual(len(self.camera_hashes()), len(files) + 21)  # one has a film
         self.assertEqual(len(self.assert_at_rest()["assets"]), CAMERA_ASSETS + SYNCED + 20)
 
 
@@ -323,7 +330,7 @@ class SmallDevices(Restores):
         self.assertEqual(self.camera_hashes(), files)
         self.assertEqual(self.own_albums(), albums)
         self.assertEqual(len(self.assert_at_rest()["assets"]), 17)
-        self.assert_nothing_to_do()
+        self.assertEqual(self.counts(self.sync()), {})
 
 
 class Interruptions(Restores):
