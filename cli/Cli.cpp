@@ -4,6 +4,7 @@
 #include <algorithm>
 #include <exception>
 
+#include "cli/BackupCommand.h"
 #include "cli/Command.h"
 #include "daemon/ConsoleLogs.h"
 #include "daemon/SyncRunner.h"
@@ -20,9 +21,11 @@ constexpr const char* kDescription =
 constexpr const char* kExamples =
     "Examples:\n"
     "  kxsync sync ~/Pictures ./device     bring a folder of photos onto the device\n"
-    "  kxsync status ./device              what is on it\n"
     "  kxsync plan ~/Pictures ./device     say what that would do, and change nothing\n"
+    "  kxsync status ./device              what is on it\n"
     "  kxsync dump ./device                all of it, as JSON\n"
+    "  kxsync backup ./device ./backup     take a backup of the device's own photos\n"
+    "  kxsync metrics ./device             what photos take of it\n"
     "\n"
     "kxsync COMMAND --help says more about a command.";
 
@@ -111,12 +114,15 @@ int parseAndPerform(const std::vector<std::string>& arguments, Console& console)
   Parsed parsed;
   addCommonOptions(app, parsed.options);
   addSyncCommand(app, parsed.action);
+  addPlanCommand(app, parsed.action);
   addStatusCommand(app, parsed.action);
   addDumpCommand(app, parsed.action);
   addShowCommand(app, parsed.action);
-  addPlanCommand(app, parsed.action);
   addSnapshotCommand(app, parsed.action);
   addRestoreCommand(app, parsed.action);
+  addBackupCommand(app, parsed.action);
+  addMetricsCommand(app, parsed.action);
+  addBackupPathsCommand(app, parsed.action);
   for (CLI::App* command : app.get_subcommands(nullptr)) addCommonOptions(*command, parsed.options);
 
   const std::string command = commandOf(app, arguments);
