@@ -124,6 +124,17 @@ TEST_F(AlbumReconciliationTest, AContainerThatIsNoManagedAlbumStays) {
       logged(LogLevel::kError, "can't delete album because it's not of type KXManagedAlbum"));
 }
 
+TEST_F(AlbumReconciliationTest, WhatAResyncCannotDeleteIsNotRenamed) {
+  AlbumSeed seed;
+  seed.uuid = "GENERIC";
+  seed.title = "Generic";
+  seed.managed = false;
+  platform.library.addAlbum(seed);
+  EXPECT_TRUE(reconcile(SnapshotBuilder().library("OTHER").album("GENERIC", "New name", {})));
+  EXPECT_EQ(albums(), "Generic[] New name(t2 n0)[]");
+  EXPECT_EQ(platform.captured.firstWithPrefix("Updating album").text, "");
+}
+
 TEST_F(AlbumReconciliationTest, AResyncMakesEveryContainerAnew) {
   addSynced("A");
   addAlbum("AL", "Old name", {"A"});

@@ -110,6 +110,22 @@ TEST_F(AssetReconciliationTest, NewAssetsAreRequestedInSnapshotOrderThenChangedO
   for (const std::string& text : texts) EXPECT_TRUE(logged(LogLevel::kInfo, text)) << text;
 }
 
+TEST_F(AssetReconciliationTest, AHostCopyThatIsOlderHasChangedToo) {
+  addSynced("A");
+  SnapshotBuilder::Asset older = hostAsset("A");
+  older.modificationDate = kHostTime - 0.001;
+  EXPECT_TRUE(reconcile(SnapshotBuilder().asset(older)));
+  EXPECT_EQ(outstanding(), (Texts{"A"}));
+  EXPECT_EQ(assets(), "");
+}
+
+TEST_F(AssetReconciliationTest, ATimeThatEqualsTheStartOfTheWalkGetsATieBreak) {
+  SnapshotBuilder::Asset first = hostAsset("A");
+  first.exposureDate = 3061152000.0 - 1.0;  // the walk begins with a time of -1
+  EXPECT_TRUE(reconcile(SnapshotBuilder().asset(first).masterAlbum({"A"})));
+  EXPECT_EQ(token("A"), -1.0 + 1 / 100000.0);
+}
+
 TEST_F(AssetReconciliationTest, AnAssetWithoutModificationDateOnTheDeviceHasChanged) {
   AssetSeed seed = syncedAsset("A");
   seed.modificationDate = std::nullopt;
@@ -188,8 +204,14 @@ TEST_F(AssetReconciliationTest, ADifferentTokenIsSet) {
   AssetSeed outside = syncedAsset("OUTSIDE");
   outside.sortToken = 3.0;
   platform.library.addAsset(outside);
-  EXPECT_TRUE(reconcile(SnapshotBuilder().asset("NONE").asset("OUTSIDE").masterAlbum({"NONE"})));
-  EXPECT_EQ(row("NONE").sortToken, deviceTime().secondsSinceReference);
+  const double time = deviceTime().secondsSinceReference;
+  AssetSeed close = syncedAsset("CLOSE");
+  close.sortToken = time + 2 / 100000.0;
+  platform.library.addAsset(close);
+  EXPECT_TRUE(reconcile(SnapshotBuilder().asset("NONE").asset("OUTSIDE").asset("CLOSE").masterAlbum(
+      {"NONE", "CLOSE"})));
+  EXPECT_EQ(row("NONE").sortToken, time);
+  EXPECT_EQ(row("CLOSE").sortToken, time + 1 / 100000.0);
   EXPECT_EQ(row("OUTSIDE").sortToken, 3.0);
 }
 
