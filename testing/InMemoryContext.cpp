@@ -9,12 +9,12 @@
 namespace kx {
 namespace {
 
-bool sameAlbum(const AlbumRow& a, const AlbumRow& b) {
+bool sameAlbum(const InMemoryAlbumRow& a, const InMemoryAlbumRow& b) {
   return std::tie(a.uuid, a.title, a.kind, a.pendingItemsType, a.pendingItemsCount, a.assets) ==
          std::tie(b.uuid, b.title, b.kind, b.pendingItemsType, b.pendingItemsCount, b.assets);
 }
 
-bool sameAsset(const AssetRow& a, const AssetRow& b) {
+bool sameAsset(const InMemoryAssetRow& a, const InMemoryAssetRow& b) {
   return a.sortToken == b.sortToken && a.location == b.location && a.faces == b.faces &&
          a.albums == b.albums;
 }
@@ -52,9 +52,9 @@ bool InMemoryLibraryState::fails(std::string_view operation, ErrorPtr* error) co
   return true;
 }
 
-bool InMemoryLibraryState::isOrderedBefore(const AlbumRow& album, const AssetRow& a,
-                                           const AssetRow& b) const {
-  const auto keyOf = [&](const AssetRow& asset) {
+bool InMemoryLibraryState::isOrderedBefore(const InMemoryAlbumRow& album, const InMemoryAssetRow& a,
+                                           const InMemoryAssetRow& b) const {
+  const auto keyOf = [&](const InMemoryAssetRow& asset) {
     std::optional<std::uint64_t> index;
     if (album.uuid && asset.uuid && orderIndex) index = orderIndex(*album.uuid, *asset.uuid);
     constexpr double kLast = std::numeric_limits<double>::infinity();
@@ -69,7 +69,7 @@ InMemoryContext::InMemoryContext(std::shared_ptr<InMemoryLibraryState> state)
 
 InMemoryContext::~InMemoryContext() = default;
 
-bool InMemoryContext::matches(const AssetRow& row, const AssetPredicate& predicate) const {
+bool InMemoryContext::matches(const InMemoryAssetRow& row, const AssetPredicate& predicate) const {
   const bool equal = row.savedAssetType == predicate.savedAssetType;
   return equal == (predicate.comparison == AssetPredicate::Comparison::kSavedAssetTypeEquals);
 }
@@ -196,8 +196,8 @@ bool InMemoryContext::commit() {
   return true;
 }
 
-void InMemoryContext::commitAlbum(std::int64_t row, const Changed<AlbumRow>& change) {
-  AlbumRow& saved = state_->store.albums[row];
+void InMemoryContext::commitAlbum(std::int64_t row, const Changed<InMemoryAlbumRow>& change) {
+  InMemoryAlbumRow& saved = state_->store.albums[row];
   if (changes_.inserted.contains(row)) {
     saved = change.now;
     return;
@@ -210,8 +210,8 @@ void InMemoryContext::commitAlbum(std::int64_t row, const Changed<AlbumRow>& cha
   takeMembers(saved.assets, change.before.assets, change.now.assets);
 }
 
-void InMemoryContext::commitAsset(std::int64_t row, const Changed<AssetRow>& change) {
-  AssetRow& saved = state_->store.assets[row];
+void InMemoryContext::commitAsset(std::int64_t row, const Changed<InMemoryAssetRow>& change) {
+  InMemoryAssetRow& saved = state_->store.assets[row];
   take(saved.sortToken, change.before.sortToken, change.now.sortToken);
   take(saved.location, change.before.location, change.now.location);
   takeMembers(saved.faces, change.before.faces, change.now.faces);
@@ -239,41 +239,41 @@ KXManagedFacePtr InMemoryContext::faceObject(std::int64_t row) {
   return object;
 }
 
-const AlbumRow& InMemoryContext::album(std::int64_t row) const {
-  static const AlbumRow kGone;
+const InMemoryAlbumRow& InMemoryContext::album(std::int64_t row) const {
+  static const InMemoryAlbumRow kGone;
   if (const auto it = changes_.albums.find(row); it != changes_.albums.end()) return it->second.now;
   const auto saved = state_->store.albums.find(row);
   return saved == state_->store.albums.end() ? kGone : saved->second;
 }
 
-const AssetRow& InMemoryContext::asset(std::int64_t row) const {
-  static const AssetRow kGone;
+const InMemoryAssetRow& InMemoryContext::asset(std::int64_t row) const {
+  static const InMemoryAssetRow kGone;
   if (const auto it = changes_.assets.find(row); it != changes_.assets.end()) return it->second.now;
   const auto saved = state_->store.assets.find(row);
   return saved == state_->store.assets.end() ? kGone : saved->second;
 }
 
-const FaceRow& InMemoryContext::face(std::int64_t row) const {
-  static const FaceRow kGone;
+const InMemoryFaceRow& InMemoryContext::face(std::int64_t row) const {
+  static const InMemoryFaceRow kGone;
   if (const auto it = changes_.newFaces.find(row); it != changes_.newFaces.end()) return it->second;
   const auto saved = state_->store.faces.find(row);
   return saved == state_->store.faces.end() ? kGone : saved->second;
 }
 
-AlbumRow& InMemoryContext::changeAlbum(std::int64_t row) {
+InMemoryAlbumRow& InMemoryContext::changeAlbum(std::int64_t row) {
   auto it = changes_.albums.find(row);
   if (it == changes_.albums.end()) {
-    const AlbumRow& saved = album(row);
-    it = changes_.albums.emplace(row, Changed<AlbumRow>{saved, saved}).first;
+    const InMemoryAlbumRow& saved = album(row);
+    it = changes_.albums.emplace(row, Changed<InMemoryAlbumRow>{saved, saved}).first;
   }
   return it->second.now;
 }
 
-AssetRow& InMemoryContext::changeAsset(std::int64_t row) {
+InMemoryAssetRow& InMemoryContext::changeAsset(std::int64_t row) {
   auto it = changes_.assets.find(row);
   if (it == changes_.assets.end()) {
-    const AssetRow& saved = asset(row);
-    it = changes_.assets.emplace(row, Changed<AssetRow>{saved, saved}).first;
+    const InMemoryAssetRow& saved = asset(row);
+    it = changes_.assets.emplace(row, Changed<InMemoryAssetRow>{saved, saved}).first;
   }
   return it->second.now;
 }
@@ -296,9 +296,9 @@ bool InMemoryContext::hasChanges(std::int64_t row) const {
 KXGenericAlbumPtr InMemoryContext::insertAlbum(SeedList which, std::int32_t kind) {
   if (state_->fails("insertAlbum", nullptr)) return nullptr;
   const std::int64_t row = state_->store.nextRow++;
-  AlbumRow fresh;
+  InMemoryAlbumRow fresh;
   fresh.kind = kind;
-  changes_.albums.emplace(row, Changed<AlbumRow>{fresh, fresh});
+  changes_.albums.emplace(row, Changed<InMemoryAlbumRow>{fresh, fresh});
   changes_.inserted.insert(row);
   std::vector<std::int64_t> rows = list(which);
   rows.push_back(row);
@@ -306,7 +306,7 @@ KXGenericAlbumPtr InMemoryContext::insertAlbum(SeedList which, std::int32_t kind
   return albumObject(row);
 }
 
-void InMemoryContext::insertFace(std::int64_t owner, FaceRow newFace) {
+void InMemoryContext::insertFace(std::int64_t owner, InMemoryFaceRow newFace) {
   const std::int64_t row = state_->store.nextRow++;
   newFace.asset = owner;
   changes_.newFaces[row] = std::move(newFace);
@@ -339,7 +339,7 @@ std::vector<std::int64_t> InMemoryContext::albumRows() const {
 std::int64_t InMemoryContext::albumWithUUID(std::string_view uuid) const {
   for (const auto& entry : state_->store.albums) {
     const bool isChanged = changes_.albums.contains(entry.first);
-    const AlbumRow& row = isChanged ? album(entry.first) : entry.second;
+    const InMemoryAlbumRow& row = isChanged ? album(entry.first) : entry.second;
     if (row.uuid == uuid && !isDeleted(entry.first)) return entry.first;
   }
   for (const std::int64_t row : changes_.inserted) {

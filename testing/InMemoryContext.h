@@ -40,7 +40,8 @@ struct InMemoryLibraryState {
   bool fails(std::string_view operation, ErrorPtr* error) const;
   // The order inside an album: by index of the asset order file, then by sort token (null last),
   // then by UUID.
-  bool isOrderedBefore(const AlbumRow& album, const AssetRow& a, const AssetRow& b) const;
+  bool isOrderedBefore(const InMemoryAlbumRow& album, const InMemoryAssetRow& a,
+                       const InMemoryAssetRow& b) const;
 };
 
 // One view of the library: objects by identity, and changes that no transaction has saved, laid
@@ -70,9 +71,9 @@ class InMemoryContext final : public KXManagedObjectContext {
     Row now;
   };
   struct Changes {
-    std::map<std::int64_t, Changed<AlbumRow>> albums;
-    std::map<std::int64_t, Changed<AssetRow>> assets;
-    std::map<std::int64_t, FaceRow> newFaces;
+    std::map<std::int64_t, Changed<InMemoryAlbumRow>> albums;
+    std::map<std::int64_t, Changed<InMemoryAssetRow>> assets;
+    std::map<std::int64_t, InMemoryFaceRow> newFaces;
     std::set<std::int64_t> inserted;
     std::set<std::int64_t> deleted;
     std::array<std::optional<std::vector<std::int64_t>>, InMemoryStore::kLists> lists;
@@ -88,18 +89,18 @@ class InMemoryContext final : public KXManagedObjectContext {
   KXManagedFacePtr faceObject(std::int64_t row);
 
   // Rows as this context sees them. Empty rows for those that are gone.
-  const AlbumRow& album(std::int64_t row) const;
-  const AssetRow& asset(std::int64_t row) const;
-  const FaceRow& face(std::int64_t row) const;
-  AlbumRow& changeAlbum(std::int64_t row);
-  AssetRow& changeAsset(std::int64_t row);
+  const InMemoryAlbumRow& album(std::int64_t row) const;
+  const InMemoryAssetRow& asset(std::int64_t row) const;
+  const InMemoryFaceRow& face(std::int64_t row) const;
+  InMemoryAlbumRow& changeAlbum(std::int64_t row);
+  InMemoryAssetRow& changeAsset(std::int64_t row);
   bool exists(std::int64_t row) const;
   bool isDeleted(std::int64_t row) const { return changes_.deleted.contains(row); }
   bool hasChanges(std::int64_t row) const;
   void deleteRow(std::int64_t row) { changes_.deleted.insert(row); }
 
   KXGenericAlbumPtr insertAlbum(SeedList list, std::int32_t kind);
-  void insertFace(std::int64_t asset, FaceRow face);
+  void insertFace(std::int64_t asset, InMemoryFaceRow face);
   std::vector<std::int64_t> list(SeedList which) const;
   void setList(SeedList which, std::vector<std::int64_t> rows);
   std::vector<std::int64_t> albumRows() const;
@@ -112,9 +113,9 @@ class InMemoryContext final : public KXManagedObjectContext {
   void touch() { ++localRevision_; }
 
  private:
-  bool matches(const AssetRow& row, const AssetPredicate& predicate) const;
-  void commitAlbum(std::int64_t row, const Changed<AlbumRow>& change);
-  void commitAsset(std::int64_t row, const Changed<AssetRow>& change);
+  bool matches(const InMemoryAssetRow& row, const AssetPredicate& predicate) const;
+  void commitAlbum(std::int64_t row, const Changed<InMemoryAlbumRow>& change);
+  void commitAsset(std::int64_t row, const Changed<InMemoryAssetRow>& change);
 
   std::shared_ptr<InMemoryLibraryState> state_;
   Changes changes_;

@@ -129,7 +129,7 @@ class InMemoryPhotoLibraryFramework::Library final : public KXPhotoLibrary {
     static_cast<void>(context());
     std::vector<std::pair<std::string, std::string>> paths;
     for (const auto& entry : shared_->state->store.assets) {
-      const AssetRow& row = entry.second;
+      const InMemoryAssetRow& row = entry.second;
       if (!row.incomplete) continue;
       paths.emplace_back(row.uuid.value_or(""), row.files.empty() ? "" : row.files.front());
     }

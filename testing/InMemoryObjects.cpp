@@ -26,7 +26,7 @@ std::optional<std::string> copyOf(OptionalString text) {
 
 }  // namespace
 
-const FaceRow& InMemoryFace::data() const {
+const InMemoryFaceRow& InMemoryFace::data() const {
   isFault_ = false;
   return context_.face(row_);
 }
@@ -45,7 +45,7 @@ std::string InMemoryFace::description() const {
   return "<KXManagedFace: " + std::to_string(identifier()) + ">";
 }
 
-const AlbumRow& InMemoryAlbum::data() const {
+const InMemoryAlbumRow& InMemoryAlbum::data() const {
   isFault_ = false;
   return context_.album(row_);
 }
@@ -129,7 +129,7 @@ void InMemoryAlbum::sortAssetsUsingTesselAlbumOrder() {
   if (members != data().assets) context_.setAlbumMembers(row_, std::move(members));
 }
 
-const AssetRow& InMemoryAsset::data() const {
+const InMemoryAssetRow& InMemoryAsset::data() const {
   isFault_ = false;
   return context_.asset(row_);
 }
@@ -167,7 +167,7 @@ std::span<const KXManagedFacePtr> InMemoryAsset::faces() {
 
 void InMemoryAsset::addFace(const Rect& relativeRect, std::uint16_t identifier,
                             OptionalString albumUUID) {
-  context_.insertFace(row_, FaceRow{identifier, relativeRect, copyOf(albumUUID), row_});
+  context_.insertFace(row_, InMemoryFaceRow{identifier, relativeRect, copyOf(albumUUID), row_});
   forgetFaces();
 }
 

@@ -39,7 +39,7 @@ class InMemoryFace final : public KXManagedFace, public FaultingObject {
   std::optional<std::string> albumUUID() const override { return data().albumUUID; }
 
  private:
-  const FaceRow& data() const;
+  const InMemoryFaceRow& data() const;
   InMemoryContext& context_;
   std::int64_t row_;
 };
@@ -76,7 +76,7 @@ class InMemoryAlbum final : public KXManagedAlbum, public FaultingObject {
   void sortAssetsUsingTesselAlbumOrder() override;
 
  private:
-  const AlbumRow& data() const;
+  const InMemoryAlbumRow& data() const;
   InMemoryContext& context_;
   std::int64_t row_;
 };
@@ -107,7 +107,7 @@ class InMemoryAsset final : public KXManagedAsset, public FaultingObject {
   void forgetFaces() { facesRevision_ = 0; }
 
  private:
-  const AssetRow& data() const;
+  const InMemoryAssetRow& data() const;
   InMemoryContext& context_;
   std::int64_t row_;
   std::vector<KXManagedFacePtr> faces_;

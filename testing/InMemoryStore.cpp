@@ -29,7 +29,7 @@ InMemoryStore::InMemoryStore() {
 
 std::int64_t InMemoryStore::addAsset(const AssetSeed& seed) {
   const std::int64_t row = nextRow++;
-  AssetRow asset;
+  InMemoryAssetRow asset;
   asset.uuid = seed.uuid;
   asset.savedAssetType = seed.savedAssetType;
   asset.isVideo = seed.isVideo;
@@ -44,7 +44,7 @@ std::int64_t InMemoryStore::addAsset(const AssetSeed& seed) {
   asset.incomplete = seed.incomplete;
   for (const FaceSeed& face : seed.faces) {
     const std::int64_t faceRow = nextRow++;
-    faces[faceRow] = FaceRow{face.identifier, face.relativeRect, face.albumUUID, row};
+    faces[faceRow] = InMemoryFaceRow{face.identifier, face.relativeRect, face.albumUUID, row};
     asset.faces.insert(faceRow);
   }
   if (seed.uuid) assetsByUUID[*seed.uuid] = row;
@@ -54,7 +54,7 @@ std::int64_t InMemoryStore::addAsset(const AssetSeed& seed) {
 
 std::int64_t InMemoryStore::addAlbum(const AlbumSeed& seed) {
   const std::int64_t row = nextRow++;
-  AlbumRow album{
+  InMemoryAlbumRow album{
       seed.uuid, seed.title, seed.kind, seed.managed, seed.pendingItemsType, seed.pendingItemsCount,
       {}};
   for (const std::string& uuid : seed.assets) {

@@ -16,14 +16,14 @@ namespace kx {
 
 // The saved rows of an in-memory photo library. Row numbers start at 1 and are never used again.
 // Used on the library's queue alone.
-struct FaceRow {
+struct InMemoryFaceRow {
   std::uint16_t identifier = 0;
   Rect relativeRect;
   std::optional<std::string> albumUUID;
   std::int64_t asset = 0;
 };
 
-struct AssetRow {
+struct InMemoryAssetRow {
   std::optional<std::string> uuid;
   std::int32_t savedAssetType = 0;
   bool isVideo = false;
@@ -40,7 +40,7 @@ struct AssetRow {
   std::set<std::int64_t> albums;
 };
 
-struct AlbumRow {
+struct InMemoryAlbumRow {
   std::optional<std::string> uuid;
   std::optional<std::string> title;
   std::int32_t kind = 0;
@@ -55,9 +55,9 @@ struct InMemoryStore {
 
   InMemoryStore();
 
-  std::map<std::int64_t, AlbumRow> albums;
-  std::map<std::int64_t, AssetRow> assets;
-  std::map<std::int64_t, FaceRow> faces;
+  std::map<std::int64_t, InMemoryAlbumRow> albums;
+  std::map<std::int64_t, InMemoryAssetRow> assets;
+  std::map<std::int64_t, InMemoryFaceRow> faces;
   std::array<std::vector<std::int64_t>, kLists> lists;
   std::unordered_map<std::string, std::int64_t> assetsByUUID;
   std::int64_t nextRow = 1;

@@ -3,12 +3,12 @@
 namespace kx {
 namespace {
 
-std::string pendingText(const AlbumRow& album) {
+std::string pendingText(const InMemoryAlbumRow& album) {
   return "t" + std::to_string(album.pendingItemsType) + " n" +
          std::to_string(album.pendingItemsCount);
 }
 
-std::string albumText(const InMemoryStore& store, const AlbumRow& album) {
+std::string albumText(const InMemoryStore& store, const InMemoryAlbumRow& album) {
   std::string text = album.title ? *album.title : "<" + album.uuid.value_or("") + ">";
   const bool atRest = album.pendingItemsType == kKXPendingItemsNone && album.pendingItemsCount == 0;
   if (!atRest) text += "(" + pendingText(album) + ")";

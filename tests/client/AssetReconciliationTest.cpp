@@ -10,8 +10,8 @@ class AssetReconciliationTest : public ClientTest {
     asset.uuid = uuid;
     return asset;
   }
-  AssetRow row(const std::string& uuid) {
-    AssetRow copy;
+  InMemoryAssetRow row(const std::string& uuid) {
+    InMemoryAssetRow copy;
     platform.library.perform([&](InMemoryLibraryState& state) {
       copy = state.store.assets.at(state.store.assetWithUUID(uuid));
     });
@@ -21,9 +21,9 @@ class AssetReconciliationTest : public ClientTest {
   Texts faces(const std::string& uuid) {
     Texts texts;
     platform.library.perform([&](InMemoryLibraryState& state) {
-      const AssetRow& asset = state.store.assets.at(state.store.assetWithUUID(uuid));
+      const InMemoryAssetRow& asset = state.store.assets.at(state.store.assetWithUUID(uuid));
       for (const std::int64_t face : asset.faces) {
-        const FaceRow& data = state.store.faces.at(face);
+        const InMemoryFaceRow& data = state.store.faces.at(face);
         texts.push_back(std::to_string(data.identifier) + " " +
                         std::to_string(static_cast<int>(data.relativeRect.x * 100)) + " " +
                         data.albumUUID.value_or("-"));
