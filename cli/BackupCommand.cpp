@@ -139,10 +139,9 @@ class Ending {
   Ending(Context& context, CancelToken& cancel)
       : context_(context), signals_(cancel, [this](int signal) {
           if (ended_.exchange(true)) return;
-          const ErrorPtr error = Error::make(
-              kSyncErrorDomain, static_cast<std::int64_t>(SyncErrorCode::kCancelled),
-              "ended by a signal; the backup before is untouched, the same command goes on from "
-              "here");
+          const ErrorPtr error =
+              Error::make(kSyncErrorDomain, static_cast<std::int64_t>(SyncErrorCode::kCancelled),
+                          "ended by a signal; the same command goes on from here");
           reportFailure(context_, error, kSignalExitBase + signal);
           context_.console.finish();
         }) {

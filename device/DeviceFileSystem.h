@@ -10,6 +10,7 @@
 namespace kx {
 
 // The device's files beneath its root. Any thread. A read-only one refuses every change (EROFS).
+// An entry that is gone when a walk comes to it is told to the error handler (ENOENT).
 class DeviceFileSystem : public FileSystem {
  public:
   DeviceFileSystem(std::shared_ptr<DeviceRoot> root, bool readOnly)
