@@ -103,8 +103,11 @@ class RestoreReport {
   }
 
   std::string libraryText(const RestoreResult& result) const {
-    const std::string added = groupedNumber(result.registered) + " photos added, " +
-                              groupedNumber(result.albumsCreated) + " albums created";
+    const auto counted = [](std::size_t number, const char* what) {
+      return groupedNumber(number) + " " + what + (number == 1 ? "" : "s");
+    };
+    const std::string added = counted(result.registered, "photo") + " added, " +
+                              counted(result.albumsCreated, "album") + " created";
     switch (result.library) {
       case RestoreLibrary::kBroughtBack:
         return "brought back from the backup";

@@ -112,6 +112,8 @@ void RestoreLoop::work(std::vector<Item> items) {
     if (cancelled_ || deviceFailure_) break;
     fetch(item);
     if (cancelled_) break;
+    ++progress_.filesDone;
+    tell();
     if (item.file != nullptr) bytes += static_cast<std::uint64_t>(item.file->size);
     batch.push_back(std::move(item));
     if (batch.size() >= kBatchFiles || bytes >= kBatchBytes ||
@@ -248,10 +250,7 @@ void RestoreLoop::settle(std::vector<Item>& batch) {
   }
   for (Item& item : batch) place(item);
   syncDirectories(batch);
-  for (const Item& item : batch) {
-    ++progress_.filesDone;
-    report(item);
-  }
+  for (const Item& item : batch) report(item);
   tell();
 }
 

@@ -49,11 +49,11 @@ RestoreResult restoreOnto(const BackupReader& backup, const RestoreOptions& give
   deviceOptions.root = options.deviceRoot;
   deviceOptions.create = true;
   deviceOptions.logs = logs;
-  if (backup.manifest().library) {
-    deviceOptions.beforeLibrary = [&](const std::shared_ptr<DeviceRoot>& root) {
-      return seeToLibrary(backup, root, &library.emplace());
-    };
-  }
+  // A device that needs its backup may have lost files: it is looked through in any case.
+  deviceOptions.beforeLibrary = [&](const std::shared_ptr<DeviceRoot>& root) -> ErrorPtr {
+    if (!backup.manifest().library) return nullptr;
+    return seeToLibrary(backup, root, &library.emplace());
+  };
   const auto device = ReferenceDevice::open(deviceOptions, &error);
   if (!device) return failedResult(error, exitCodeForDeviceError(error));
   return RestoreSession({backup, *device, options, progress, cancel}, library).run();

@@ -232,6 +232,39 @@ TEST_F(RestoreTest, LinksOnTheDeviceLeadNowhere) {
   EXPECT_EQ(work.fingerprint("outside"), outside);
 }
 
+TEST_F(RestoreTest, WhatIsNoFileInTheBackupFailsAloneAndByName) {
+  BackupBuilder backup(work);
+  fill(backup);
+  const std::string photo = backup.path() + "/DCIM/100APPLE/IMG_0001.JPG";
+  fs::rename(photo, work.at("elsewhere"));
+  fs::create_symlink(work.at("elsewhere"), photo);
+  fs::remove(backup.path() + "/DCIM/100APPLE/IMG_0002.JPG");
+  ASSERT_EQ(::mkfifo((backup.path() + "/DCIM/100APPLE/IMG_0002.JPG").c_str(), 0600), 0);
+  const RestoreResult result = restore(backup);
+  EXPECT_EQ(result.exitCode, kExitPartial);
+  EXPECT_THAT(failedPaths(result), UnorderedElementsAre("IMG_0001.JPG", "IMG_0002.JPG"));
+  for (const RestoreFailure& failure : result.failed) {
+    EXPECT_EQ(failure.code, kFRErrorDamagedInBackup);
+  }
+  EXPECT_EQ(result.restored, 2U);
+  expectAtRest();
+}
+
+TEST_F(RestoreTest, ALostFileOfAPhotoThatIsKnownCompletesIt) {
+  BackupBuilder backup(work);
+  fill(backup);
+  restore(backup);
+  const std::string before = dump().assets.at(1).uuid;
+  fs::remove_all(work.at(onDevice("")));
+  const RestoreResult again = restore(backup);
+  EXPECT_EQ(again.outcome, RestoreOutcome::kRestored);
+  EXPECT_EQ(again.restored, 4U);
+  EXPECT_EQ(again.registered, 0U);
+  EXPECT_EQ(again.albumsCreated, 0U);
+  EXPECT_EQ(dump().assets.at(1).uuid, before);
+  expectAtRest();
+}
+
 TEST_F(RestoreTest, FilesBeyondTheCameraAreRefused) {
   BackupBuilder backup(work);
   backup.add("100APPLE/IMG_0001.JPG", kJpeg);

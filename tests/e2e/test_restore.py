@@ -193,7 +193,7 @@ class SmallDevices(Restores):
         self.make_camera(1, first=500, albums=[("Newer", [500])])
         done = kxsync("restore", self.backup, self.device)
         self.assertEqual(done.code, 0, str(done))
-        self.assertIn("the device's own is kept; 12 photos added, 1 albums created", done.out)
+        self.assertIn("the device's own is kept; 12 photos added, 1 album created", done.out)
         self.assertEqual([title for _, title, _ in self.own_albums()], ["Mine", "Newer"])
         self.assertEqual(len(self.assert_at_rest()["assets"]), 13)
 
