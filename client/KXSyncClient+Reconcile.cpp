@@ -36,7 +36,8 @@ bool KXSyncClient::reconcileSync(std::uint32_t syncType, const std::string& newA
   _initializeLibrary();
 
   ErrorPtr decoderError;
-  const KXSLibraryChangeSnapshotPtr snapshot = decodeNewSnapshot(error, &decoderError);
+  DataPtr bytes;
+  const KXSLibraryChangeSnapshotPtr snapshot = decodeNewSnapshot(&bytes, error, &decoderError);
   KX_LOG(kClientSource, kReconcileFunction, LogLevel::kError, "snapshot %@ err: %@", snapshot,
          decoderError);
   if (decoderError) {
@@ -53,9 +54,9 @@ bool KXSyncClient::reconcileSync(std::uint32_t syncType, const std::string& newA
   }
   _initializeOutstandingAssets();
 
-  OptionalString previousUUID;
-  const KXSLibraryChangeSnapshotPtr previous = previousSnapshot(&previousUUID);
-  const bool isNullSync = snapshot->isEqualToSnapshot(previous);
+  std::optional<std::string> previousUUID;
+  const bool isNullSync = equalsPreviousSnapshot(*snapshot, bytes, &previousUUID);
+  bytes.reset();
   const bool isResync = decideResync(previousUUID, *snapshot);
   Dictionary current;
   current.setIfPresent(kLibraryUUID, Value::optionalString(snapshot->libraryUUID()));
@@ -71,15 +72,17 @@ bool KXSyncClient::reconcileSync(std::uint32_t syncType, const std::string& newA
 }
 
 // Reads and decodes the snapshot file and keeps what the host said about itself. Null when nothing
-// could be decoded; the reader's error goes to `error`.
-KXSLibraryChangeSnapshotPtr KXSyncClient::decodeNewSnapshot(ErrorPtr* error,
+// could be decoded; the reader's error goes to `error`. `bytes` are the file's, null when another
+// decoder than ours has made something of them.
+KXSLibraryChangeSnapshotPtr KXSyncClient::decodeNewSnapshot(DataPtr* bytes, ErrorPtr* error,
                                                             ErrorPtr* decoderError) {
   KX_LOG(kClientSource, kReconcileFunction, LogLevel::kInfo, "Loading up change snapshot");
   KX_LOG(kClientSource, kReconcileFunction, LogLevel::kInfo, "Sync url %@",
          std::string(kFileURLScheme) + kKXSnapshotPath);
-  const std::shared_ptr<KXSTransportDecoder> decoder =
-      platform_.snapshotDecoder(KXSTransportDecoder::decoder());
-  const Value root = readPropertyListFile(platform_.files(), kKXSnapshotPath, error);
+  const std::shared_ptr<KXSTransportDecoder> own = KXSTransportDecoder::decoder();
+  const std::shared_ptr<KXSTransportDecoder> decoder = platform_.snapshotDecoder(own);
+  DataPtr* const read = decoder == own ? bytes : nullptr;
+  const Value root = readPropertyListFile(platform_.files(), kKXSnapshotPath, error, read);
   const std::string agentPath = platform_.photoLibrary().syncInfoPath();
   removeSyncUserAgentInfoFile(agentPath);
   if (!root.isDictionary()) return nullptr;
@@ -102,18 +105,27 @@ void KXSyncClient::removeSyncUserAgentInfoFile(const std::string& path) {
          "Failed to remove syncUserAgentInfoFile at path %@ err: %@", path, error);
 }
 
-// The snapshot of the last completed sync with the identifier of its library. Whatever is wrong
-// with that file, it only means that there is no previous snapshot.
-KXSLibraryChangeSnapshotPtr KXSyncClient::previousSnapshot(OptionalString* libraryUUID) {
-  const Value root = readDictionary(KXPreviousMetadataSyncFilePath);
-  if (root.isNull()) return nullptr;
+// Whether the snapshot of the last completed sync equals the new one, and the identifier of its
+// library. Whatever is wrong with that file, it only means that there is no previous snapshot. When
+// its bytes are those of the new one it is not decoded.
+bool KXSyncClient::equalsPreviousSnapshot(const KXSLibraryChangeSnapshot& snapshot,
+                                          const DataPtr& bytes,
+                                          std::optional<std::string>* libraryUUID) {
+  const DataPtr last = platform_.files().readFile(KXPreviousMetadataSyncFilePath, nullptr);
+  if (!last) return false;
+  if (bytes && bytes->isEqualToData(*last)) {
+    *libraryUUID = snapshot.libraryUUID();
+    return snapshot.isEqualToTwin();
+  }
+  const Value root = readPropertyList(last, nullptr);
+  if (!root.isDictionary()) return false;
   try {
-    KXSLibraryChangeSnapshotPtr previous =
+    const KXSLibraryChangeSnapshotPtr previous =
         KXSTransportDecoder::decoder()->decodeSnapshotFromPropertyList(root, nullptr);
     *libraryUUID = previous->libraryUUID();
-    return previous;
+    return snapshot.isEqualToSnapshot(previous);
   } catch (const std::exception&) {
-    return nullptr;
+    return false;
   }
 }
 

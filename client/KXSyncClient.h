@@ -180,9 +180,11 @@ class KXSyncClient final : public FRClient {
   void assertNotOnMainThread() const;
 
   // Reconcile driver.
-  KXSLibraryChangeSnapshotPtr decodeNewSnapshot(ErrorPtr* error, ErrorPtr* decoderError);
+  KXSLibraryChangeSnapshotPtr decodeNewSnapshot(DataPtr* bytes, ErrorPtr* error,
+                                                ErrorPtr* decoderError);
   void removeSyncUserAgentInfoFile(const std::string& path);
-  KXSLibraryChangeSnapshotPtr previousSnapshot(OptionalString* libraryUUID);
+  bool equalsPreviousSnapshot(const KXSLibraryChangeSnapshot& snapshot, const DataPtr& bytes,
+                              std::optional<std::string>* libraryUUID);
   bool decideResync(OptionalString previousUUID, const KXSLibraryChangeSnapshot& snapshot);
   void reconcileSnapshot(const KXSLibraryChangeSnapshotPtr& snapshot, bool isResync);
   void writeDictionary(const std::string& path, Dictionary dictionary);

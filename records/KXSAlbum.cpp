@@ -76,7 +76,10 @@ bool KXSAlbum::isEqualToAlbum(const KXSItem* other) const {
     KX_LOG("KXSAlbum", "isEqualToAlbum", LogLevel::kError, "otherAlbum isn't an album");
     return false;
   }
-  if (album == this) return true;
+  return album == this || hasEqualFields(*album);
+}
+
+bool KXSAlbum::hasEqualFields(const KXSAlbum& other) const {
   struct Comparison {
     std::size_t slot;
     const char* message;
@@ -89,12 +92,12 @@ bool KXSAlbum::isEqualToAlbum(const KXSItem* other) const {
       {kKeyAssetUUID, "album keyAssetUUID not equal"},
   }};
   for (const Comparison& comparison : kComparisons) {
-    if (!RecordFields::equal(fields_, album->fields_, comparison.slot)) {
+    if (!RecordFields::equal(fields_, other.fields_, comparison.slot)) {
       KX_LOG("KXSAlbum", "isEqualToAlbum", LogLevel::kDebug, comparison.message);
       return false;
     }
   }
-  return hasEqualAssetUUIDs(*album);
+  return hasEqualAssetUUIDs(other);
 }
 
 bool KXSAlbum::hasEqualAssetUUIDs(const KXSAlbum& other) const {

@@ -37,6 +37,8 @@ class KXSAlbum final : public KXSItem {
   // assets counts. Never raises.
   bool isEqualToAlbum(const KXSItem* other) const;
   bool isEqualToAlbum(const KXSItemPtr& other) const { return isEqualToAlbum(other.get()); }
+  // The same without the rule that an album equals itself: a number that is none equals nothing.
+  bool hasEqualFields(const KXSAlbum& other) const;
 
   OptionalString name() const { return fields_.string(kName, kKXSAlbumNameKey); }
   void setName(OptionalString name) { fields_.set(kName, Value::optionalString(name)); }

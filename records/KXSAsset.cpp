@@ -128,16 +128,19 @@ std::vector<KXSFacePtr> KXSAsset::getFacesArray() const {
 
 bool KXSAsset::isEquivalentTo(const KXSAsset* other) const {
   if (other == this) return true;
-  if (other == nullptr) return false;
-  const auto equal = [this, other](std::size_t slot) {
-    return RecordFields::equal(fields_, other->fields_, slot);
+  return other != nullptr && hasEquivalentFields(*other);
+}
+
+bool KXSAsset::hasEquivalentFields(const KXSAsset& other) const {
+  const auto equal = [this, &other](std::size_t slot) {
+    return RecordFields::equal(fields_, other.fields_, slot);
   };
   if (!equal(kExposureDate) || !equal(kModificationDate)) return false;
   // No null rule here: the comparison is asked of this asset's number, and a null one says no.
   if (fields_.isNull(kLatitude) || !equal(kLatitude)) return false;
   if (fields_.isNull(kLongitude) || !equal(kLongitude)) return false;
   if (!equal(kOriginalFileName)) return false;
-  return fields_.count(kFaces) == other->fields_.count(kFaces);
+  return fields_.count(kFaces) == other.fields_.count(kFaces);
 }
 
 bool KXSAsset::isVideo() const {

@@ -47,6 +47,8 @@ class KXSAsset final : public KXSItem {
   // is equivalent to nothing, not even to null. Never raises.
   bool isEquivalentTo(const KXSAsset* other) const;
   bool isEquivalentTo(const KXSAssetPtr& other) const { return isEquivalentTo(other.get()); }
+  // The same without the rule that an asset is equivalent to itself.
+  bool hasEquivalentFields(const KXSAsset& other) const;
 
   std::optional<Number> rating() const { return fields_.number(kRating, kKXSAssetRatingKey); }
   void setRating(Value rating) { fields_.set(kRating, std::move(rating)); }

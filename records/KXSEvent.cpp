@@ -71,6 +71,10 @@ bool KXSEvent::isEqualToEvent(const KXSItem* other) const {
     KX_LOG("KXSEvent", "isEqualToEvent", LogLevel::kError, "otherEvent isn't an event");
     return false;
   }
+  return hasEqualFields(*event);
+}
+
+bool KXSEvent::hasEqualFields(const KXSEvent& other) const {
   struct Comparison {
     std::size_t slot;
     const char* message;
@@ -81,7 +85,7 @@ bool KXSEvent::isEqualToEvent(const KXSItem* other) const {
       {kKeyAssetUUID, "event keyAssetUUID not equal"},
   }};
   for (const Comparison& comparison : kComparisons) {
-    if (!RecordFields::equal(fields_, event->fields_, comparison.slot)) {
+    if (!RecordFields::equal(fields_, other.fields_, comparison.slot)) {
       KX_LOG("KXSEvent", "isEqualToEvent", LogLevel::kDebug, comparison.message);
       return false;
     }

@@ -40,6 +40,8 @@ class KXSEvent final : public KXSItem {
   // Logs the first difference; false for null and for an item of another class. Never raises.
   bool isEqualToEvent(const KXSItem* other) const;
   bool isEqualToEvent(const KXSItemPtr& other) const { return isEqualToEvent(other.get()); }
+  // The same without the rule that an event equals itself.
+  bool hasEqualFields(const KXSEvent& other) const;
 
   OptionalString name() const { return fields_.string(kName, kKXSEventNameKey); }
   void setName(OptionalString name) { fields_.set(kName, Value::optionalString(name)); }

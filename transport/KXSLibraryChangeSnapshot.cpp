@@ -139,6 +139,29 @@ bool KXSLibraryChangeSnapshot::isEqualToSnapshot(const KXSLibraryChangeSnapshot*
   return hasEquivalentAssets(*other);
 }
 
+bool KXSLibraryChangeSnapshot::isEqualToTwin() const {
+  if (!equalValues(libraryKind_, libraryKind_) || !equalValues(libraryUUID_, libraryUUID_)) {
+    logDifference("snapshot libraryKind or libraryUUID not equal");
+    return false;
+  }
+  static const KXSItemList kNoItems;
+  for (const KXSItemPtr& item : orderedAlbums_ ? *orderedAlbums_ : kNoItems) {
+    const auto* album = dynamic_cast<const KXSAlbum*>(item.get());
+    const auto* event = dynamic_cast<const KXSEvent*>(item.get());
+    if (album != nullptr ? album->hasEqualFields(*album)
+                         : event != nullptr && event->hasEqualFields(*event)) {
+      continue;
+    }
+    logDifference("snapshot albums not equal");
+    return false;
+  }
+  static const KXSAssetMap kNoAssets;
+  for (const auto& entry : assetsByUUID_ ? *assetsByUUID_ : kNoAssets) {
+    if (!entry.value->hasEquivalentFields(*entry.value)) return false;
+  }
+  return true;
+}
+
 bool KXSLibraryChangeSnapshot::hasEqualAlbums(const KXSLibraryChangeSnapshot& other) const {
   for (std::size_t i = 0; i < countOf(orderedAlbums_); ++i) {
     if (!equalItems(*(*orderedAlbums_)[i], *(*other.orderedAlbums_)[i])) return false;

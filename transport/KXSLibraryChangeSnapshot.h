@@ -54,6 +54,10 @@ class KXSLibraryChangeSnapshot final : public Archivable {
     return isEqualToSnapshot(other.get());
   }
 
+  // What isEqualToSnapshot answers for another snapshot decoded from the same bytes, without
+  // decoding them again. Not always yes: an asset without a location is equivalent to no other.
+  bool isEqualToTwin() const;
+
   // Null-tolerant comparisons: both null, or the first is not null and equal to the second.
   static bool stringEqualsString(OptionalString first, OptionalString second);
   static bool numberEqualsNumber(const std::optional<Number>& first,

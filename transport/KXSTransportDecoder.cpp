@@ -147,9 +147,11 @@ ErrorPtr readFailure(const ErrorPtr& cause) {
 
 }  // namespace
 
-Value readPropertyListFile(FileSystem& files, const std::string& path, ErrorPtr* error) {
+Value readPropertyListFile(FileSystem& files, const std::string& path, ErrorPtr* error,
+                           DataPtr* read) {
   ErrorPtr cause;
   DataPtr bytes = files.readFile(path, &cause);
+  if (read != nullptr) *read = bytes;
   if (bytes) return readPropertyList(std::move(bytes), error);
   setError(error, readFailure(cause));
   return Value();

@@ -3,6 +3,8 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <limits>
+
 #include "records/KXSFolder.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/PropertyLists.h"
@@ -127,6 +129,34 @@ TEST(SnapshotEquality, NullAndTheVerySameSnapshotLogNothing) {
 TEST(SnapshotEquality, EqualFilesAreEqual) {
   const Value full = root({album("A"), event("E"), asset("1"), asset("2")});
   EXPECT_EQ(differenceLogged(full, full, true), "");
+}
+
+TEST(SnapshotEquality, AnswersForATwinWhatItAnswersForASecondDecoding) {
+  const Value notANumber = Value::real(std::numeric_limits<double>::quiet_NaN());
+  const Value oddAlbum =
+      dict({{"uuid", text("A")}, {"itemType", text("Album")}, {"subclass", notANumber}});
+  const Value oddEvent =
+      dict({{"uuid", text("E")}, {"itemType", text("Event")}, {"eventName", notANumber}});
+  const Value members = dict({{"uuid", text("M")},
+                              {"itemType", text("Album")},
+                              {"assetUUIDs", list({text("1"), notANumber})}});
+  const std::pair<Value, bool> cases[] = {
+      {root({}), true},
+      {root({album("A"), event("E"), asset("1"), asset("2")}), true},
+      {root({album("A"), asset("1"), unlocated("2")}), false},
+      {root({asset("1", std::numeric_limits<double>::quiet_NaN())}), true},
+      {root({oddAlbum, asset("1")}), true},
+      {root({oddEvent, asset("1")}), true},
+      {root({members, asset("1")}), true},
+      {dict({{"libraryKind", notANumber}}), true},
+      {dict({{"libraryUUID", notANumber}}), true},
+  };
+  for (const auto& [value, isEqual] : cases) {
+    for (const Value& form : {value, throughFile(value)}) {
+      EXPECT_EQ(decode(form)->isEqualToTwin(), isEqual) << value.description();
+      EXPECT_EQ(decode(form)->isEqualToSnapshot(decode(form)), isEqual) << value.description();
+    }
+  }
 }
 
 TEST(SnapshotEquality, OrderOfAssetsDoesNotCount) {
