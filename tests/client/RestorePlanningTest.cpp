@@ -261,7 +261,8 @@ TEST_F(RestorePlanningTest, TheOrderIsThatOfTheBytesAndTheGroupsThatOfTheList) {
   platform.backup.paths = {lower, kB, kA};
   EXPECT_EQ(plan(), (Texts{kA, kB, lower}));
   Texts groups;
-  for (const auto& entry : *client->restorePathToAssetGroup()) groups.emplace_back(entry.key.stringValue());
+  for (const auto& entry : *client->restorePathToAssetGroup())
+    groups.emplace_back(entry.key.stringValue());
   const std::string folder = std::string(kDcim) + "/100AB/";
   EXPECT_EQ(groups, (Texts{folder + "a", folder + "B", folder + "A"}));
 }

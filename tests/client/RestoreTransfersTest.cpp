@@ -131,11 +131,13 @@ TEST_F(RestoreTransfersTest, APathThatIsThereTwiceIsSettledTwice) {
   // Two assets may name one file; nothing removes the second.
   client->_clearSyncState();
   platform.memoryFiles.removeItem(KXSyncClient::pathToRestoreContext(platform), nullptr);
-  platform.backup.paths = {kA, kA};
+  platform.backup.paths = {kA, kMovie, kA};
   client->outstandingAssetTransfers();
   client->assetTransfer(request(kA), false, frError(5));
   EXPECT_EQ(restoredOnDisk(), (Texts{kA, kA}));
-  EXPECT_EQ(platform.porter.updates(), (Updates{{"UA", {}}}));
+  EXPECT_EQ(outstanding(), (Texts{kA, kMovie}));
+  client->assetTransfer(request(kMovie), true, nullptr);
+  EXPECT_EQ(platform.porter.updates(), (Updates{{"UA", {kMovie}}}));
 }
 
 TEST_F(RestoreTransfersTest, AFailureWithoutErrorEndsAtOnce) {
