@@ -91,17 +91,31 @@ class Side {
     return found;
   }
 
-  // In the album's order.
-  std::vector<std::string> members(RowId album) {
-    std::vector<std::string> found;
-    SqliteStatement row(database_,
-                        "SELECT a.uuid FROM memberships m JOIN assets a ON a.pk = m.asset "
-                        "WHERE m.album = ? ORDER BY m.position IS NULL, m.position, "
-                        "iif(m.position IS NULL, a.sort_token IS NULL, 0), "
-                        "iif(m.position IS NULL, a.sort_token, 0), a.uuid");
-    row.integer(album);
-    while (row.step()) found.push_back(row.textAt(0));
+  // The rows of the members, in the album's order.
+  std::vector<RowId> members(RowId album) {
+    std::vector<std::pair<std::int64_t, RowId>> placed;
+    {
+      SqliteStatement row(database_, "SELECT position, asset FROM memberships WHERE album = ?");
+      row.integer(album);
+      while (row.step()) {
+        if (row.isNull(0)) return membersByTheirAssets(album);
+        placed.emplace_back(row.integerAt(0), row.integerAt(1));
+      }
+    }
+    std::sort(placed.begin(), placed.end());
+    std::vector<RowId> found;
+    found.reserve(placed.size());
+    for (std::size_t i = 0; i < placed.size(); ++i) {
+      if (i > 0 && placed[i].first == placed[i - 1].first) return membersByTheirAssets(album);
+      found.push_back(placed[i].second);
+    }
     return found;
+  }
+
+  std::size_t memberCount(RowId album) {
+    SqliteStatement row(database_, "SELECT count(*) FROM memberships WHERE album = ?");
+    row.integer(album);
+    return row.step() ? static_cast<std::size_t>(row.integerAt(0)) : 0;
   }
 
   std::vector<std::string> list(ListId list) {
@@ -115,6 +129,19 @@ class Side {
   }
 
  private:
+  // Where positions alone do not say the order.
+  std::vector<RowId> membersByTheirAssets(RowId album) {
+    std::vector<RowId> found;
+    SqliteStatement row(database_,
+                        "SELECT a.pk FROM memberships m JOIN assets a ON a.pk = m.asset "
+                        "WHERE m.album = ? ORDER BY m.position IS NULL, m.position, "
+                        "iif(m.position IS NULL, a.sort_token IS NULL, 0), "
+                        "iif(m.position IS NULL, a.sort_token, 0), a.uuid");
+    row.integer(album);
+    while (row.step()) found.push_back(row.integerAt(0));
+    return found;
+  }
+
   SqliteDatabase& database_;
 };
 
@@ -124,24 +151,25 @@ struct ListDifference {
   bool reordered = false;
 };
 
-ListDifference compare(const std::vector<std::string>& before,
-                       const std::vector<std::string>& after) {
-  const std::unordered_set<std::string_view> inBefore(before.begin(), before.end());
-  const std::unordered_set<std::string_view> inAfter(after.begin(), after.end());
+template <typename Member>
+ListDifference compare(const std::vector<Member>& before, const std::vector<Member>& after) {
   ListDifference difference;
-  std::vector<std::string_view> stayed;
-  for (const std::string& uuid : before) {
-    if (inAfter.contains(uuid)) {
-      stayed.push_back(uuid);
+  if (before == after) return difference;
+  const std::unordered_set<Member> inBefore(before.begin(), before.end());
+  const std::unordered_set<Member> inAfter(after.begin(), after.end());
+  std::vector<Member> stayed;
+  for (const Member& member : before) {
+    if (inAfter.contains(member)) {
+      stayed.push_back(member);
     } else {
       ++difference.removed;
     }
   }
   auto next = stayed.begin();
-  for (const std::string& uuid : after) {
-    if (!inBefore.contains(uuid)) {
+  for (const Member& member : after) {
+    if (!inBefore.contains(member)) {
       ++difference.added;
-    } else if (next == stayed.end() || *next++ != uuid) {
+    } else if (next == stayed.end() || *next++ != member) {
       difference.reordered = true;
     }
   }
@@ -191,6 +219,8 @@ class Comparison {
     asset.content = old && now && changes_.importedAssets.contains(uuid);
     const std::vector<RowId> oldAlbums = old ? before_->albumsOf(old->pk) : std::vector<RowId>();
     const std::vector<RowId> nowAlbums = now ? after_.albumsOf(now->pk) : std::vector<RowId>();
+    if (now && changes_.importedAssets.contains(uuid))
+      rowsBefore_[now->pk] = old ? old->pk : -now->pk;
     if (old && now) {
       asset.place = old->latitude != now->latitude || old->longitude != now->longitude;
       asset.sortToken = old->sortToken != now->sortToken;
@@ -209,7 +239,7 @@ class Comparison {
       const auto kept = now.byUUID.find(uuid);
       if (kept == now.byUUID.end()) {
         LibraryDifference::Container gone = describe(uuid, old.byUUID.at(uuid), Fate::kGone);
-        gone.left = before_->members(old.byUUID.at(uuid).pk).size();
+        gone.left = before_->memberCount(old.byUUID.at(uuid).pk);
         difference_.containers.push_back(std::move(gone));
       } else {
         compareContainer(uuid, old.byUUID.at(uuid), kept->second);
@@ -218,7 +248,7 @@ class Comparison {
     for (const std::string& uuid : now.inOrder) {
       if (old.byUUID.contains(uuid)) continue;
       LibraryDifference::Container made = describe(uuid, now.byUUID.at(uuid), Fate::kNew);
-      made.joined = after_.members(now.byUUID.at(uuid).pk).size();
+      made.joined = after_.memberCount(now.byUUID.at(uuid).pk);
       difference_.containers.push_back(std::move(made));
     }
   }
@@ -243,15 +273,23 @@ class Comparison {
     const bool touched = old.pk != now.pk || old.orderTag != now.orderTag ||
                          touchedBefore_.contains(old.pk) || touchedAfter_.contains(now.pk);
     if (touched) {
-      const ListDifference members = compare(before_->members(old.pk), after_.members(now.pk));
-      container.joined = members.added;
-      container.left = members.removed;
-      container.reordered = members.reordered;
+      std::vector<RowId> members = after_.members(now.pk);
+      for (RowId& member : members) member = rowBefore(member);
+      const ListDifference difference = compare(before_->members(old.pk), members);
+      container.joined = difference.added;
+      container.left = difference.removed;
+      container.reordered = difference.reordered;
     }
     if (container.renamed || old.title != now.title || container.joined + container.left > 0 ||
         container.reordered) {
       difference_.containers.push_back(std::move(container));
     }
+  }
+
+  // The row that the asset had before; one that no row of before has for a new asset.
+  RowId rowBefore(RowId now) const {
+    const auto found = rowsBefore_.find(now);
+    return found == rowsBefore_.end() ? now : found->second;
   }
 
   void compareLists() {
@@ -269,6 +307,7 @@ class Comparison {
   LibraryDifference difference_;
   std::vector<std::pair<RowId, LibraryDifference::Asset>> assets_;
   RowSet touchedBefore_, touchedAfter_;
+  std::unordered_map<RowId, RowId> rowsBefore_;  // of imported assets, whose row may be a used one
 };
 
 }  // namespace
