@@ -25,6 +25,7 @@ constexpr const char* kExamples =
     "  kxsync status ./device              what is on it\n"
     "  kxsync dump ./device                all of it, as JSON\n"
     "  kxsync backup ./device ./backup     take a backup of the device's own photos\n"
+    "  kxsync restore ./backup ./device    bring it back, also onto another device\n"
     "  kxsync metrics ./device             what photos take of it\n"
     "\n"
     "kxsync COMMAND --help says more about a command.";

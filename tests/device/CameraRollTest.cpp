@@ -1,7 +1,9 @@
 #include "device/CameraRoll.h"
 
 #include <fcntl.h>
+#include <sys/mman.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <random>
@@ -72,6 +74,33 @@ TEST(CameraMetadataTest, StandsAnyBytes) {
       content[random() % content.size()] = static_cast<char>(random());
     }
     const CameraMetadata metadata = exifOf(content);
+    if (metadata.captured) ++read;
+    if (metadata.place) {
+      EXPECT_LE(std::abs(metadata.place->latitude), 90.0);
+      EXPECT_LE(std::abs(metadata.place->longitude), 180.0);
+    }
+  }
+  EXPECT_GT(read, 0U);
+}
+
+TEST(CameraMetadataTest, StandsAnyFilm) {
+  const auto seed = std::random_device()();
+  SCOPED_TRACE("seed " + std::to_string(seed));
+  std::mt19937 random(seed);
+  const std::string whole = cameraFilm(3660771845U, "+10.5000-020.2500/");
+  const UniqueFd file(::memfd_create("film", MFD_CLOEXEC));
+  ASSERT_TRUE(file);
+  std::size_t read = 0;
+  for (int round = 0; round < 5000; ++round) {
+    std::string content = whole.substr(0, 1 + random() % whole.size());
+    if (round % 2 == 0) content = whole;
+    for (int changes = static_cast<int>(random() % 4); changes > 0; --changes) {
+      content[random() % content.size()] = static_cast<char>(random());
+    }
+    ASSERT_EQ(::ftruncate(file.get(), 0), 0);
+    ASSERT_EQ(::pwrite(file.get(), content.data(), content.size(), 0),
+              static_cast<ssize_t>(content.size()));
+    const CameraMetadata metadata = readFilmHeader(file.get(), content.size());
     if (metadata.captured) ++read;
     if (metadata.place) {
       EXPECT_LE(std::abs(metadata.place->latitude), 90.0);
