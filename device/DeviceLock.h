@@ -29,8 +29,8 @@ class DeviceLock {
   // Null and kLocked (with "pid") when another process holds it, kIo when it cannot be had.
   static std::unique_ptr<DeviceLock> take(const std::shared_ptr<DeviceRoot>& root, ErrorPtr* error);
 
-  // The lock as one of several that only read: no process can take it meanwhile. The file is neither
-  // made nor written. Null without an error when there is none.
+  // The lock as one of several that only read: no process can take it meanwhile. The file is
+  // neither made nor written. Null without an error when there is none.
   static std::unique_ptr<DeviceLock> share(const std::shared_ptr<DeviceRoot>& root,
                                            ErrorPtr* error);
 
