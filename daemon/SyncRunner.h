@@ -27,7 +27,7 @@ struct SyncOptions {
   std::function<void(const std::string&)> notice;
 };
 
-// The last two are a restore's own.
+// The last two are of a restore; planned transfers, too, are kPlanning.
 enum class SyncPhase {
   kChecking,
   kPreparing,
