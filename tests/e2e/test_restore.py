@@ -387,10 +387,10 @@ class Interruptions(Restores):
 FULL_DISK = """
 set -e
 kxsync=$1; backup=$2; device=$3
-mount -t tmpfs -o size=$4k none "$device"
+mount -t tmpfs -o "$4" none "$device"
 set +e
 "$kxsync" restore "$backup" "$device" --json; first=$?
-mount -o remount,size=400m "$device"
+mount -o remount,size=400m,nr_inodes=100k "$device"
 "$kxsync" restore "$backup" "$device" --json; second=$?
 "$kxsync" dump "$device" --json --hash
 echo "[$first, $second]"
@@ -406,16 +406,18 @@ def can_mount():
 @unittest.skipUnless(can_mount(), "needs a mount namespace of its own")
 class AFullDisk(Restores):
 
-    def test_it_says_so_and_goes_on_once_there_is_room(self):
+    def check(self, *options):
+        """A restore that finds no room, and one after there is room, at each of the sizes."""
         self.make_camera(20)
         self.take()
         target = self.path("target")
         os.mkdir(target)
         os.chmod(target, stat.S_IRWXU)
-        for size in (64, 1024, 20 * 1024):
-            with self.subTest(size=size):
+        brought = []
+        for option in options:
+            with self.subTest(option=option):
                 done = subprocess.run(["unshare", "-rm", "sh", "-c", FULL_DISK, "sh", KXSYNC,
-                                       self.backup, target, str(size)], capture_output=True,
+                                       self.backup, target, option], capture_output=True,
                                       text=True, env=environment(), check=False)
                 lines = done.stdout.splitlines()
                 self.assertEqual(len(lines), 4, done.stdout[:2000] + done.stderr[:2000])
@@ -424,6 +426,16 @@ class AFullDisk(Restores):
                 self.assertIn("no space left on the device", full["error"]["message"])
                 self.assertEqual(again["outcome"], "restored")
                 self.assertEqual(len(dump["assets"]), 20)
+                brought.append(full["restored"])
+        return brought
+
+    def test_too_little_room_is_said_before_anything_is_brought(self):
+        self.assertEqual(set(self.check("size=64k", "size=1m", "size=20m")), {0})
+
+    def test_a_disk_that_fills_up_in_the_middle(self):
+        """There is room for the bytes, but not for that many files."""
+        brought = self.check(*[f"size=300m,nr_inodes={count}" for count in range(18, 38, 3)])
+        self.assertGreater(max(brought), 0)
 
 
 if __name__ == "__main__":
