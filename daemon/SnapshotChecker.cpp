@@ -2,8 +2,10 @@
 
 #include <array>
 #include <cmath>
+#include <unordered_map>
 
 #include "daemon/SyncRunner.h"
+#include "platform/foundation/EntryPeek.h"
 #include "platform/foundation/Limits.h"
 #include "platform/foundation/PropertyList.h"
 #include "platform/foundation/Text.h"
@@ -70,22 +72,41 @@ constexpr std::array kRectangleRules{
     KeyRule{"Height", Rule::kFiniteNumber},
 };
 
-// Rules by key. In a binary document a key's text is compared once, then known by its object index.
+// Rules by key. Most dictionaries of a file hold the same key objects in the same order: their keys
+// are looked at once.
 class RuleTable {
  public:
   template <std::size_t N>
   explicit RuleTable(const std::array<KeyRule, N>& rules) : rules_(rules.data()), count_(N) {}
 
-  Rule ruleAt(const DictionaryView& dictionary, std::size_t index) {
-    const auto object = dictionary.keyObjectIndexAt(index);
-    if (!object) return ruleOf(dictionary.keyAt(index));
-    if (known_.empty()) known_.resize(dictionary.documentObjectCount(), 0);
-    std::uint8_t& known = known_[*object];
-    if (known == 0) known = static_cast<std::uint8_t>(ruleOf(dictionary.keyAt(index))) + 1;
-    return static_cast<Rule>(known - 1);
+  // By position; valid until the next call.
+  const std::vector<Rule>& rulesOf(const Value& dictionary) {
+    if (!EntryPeek::can(dictionary)) {
+      fill(dictionary, scratch_);
+      return scratch_;
+    }
+    const std::string_view keys = EntryPeek::keyBytes(dictionary);
+    if (last_ != nullptr && keys == lastKeys_) return *last_;
+    auto known = layouts_.find(std::string(keys));
+    if (known == layouts_.end()) {
+      if (layouts_.size() == kMostLayouts) layouts_.clear();
+      known = layouts_.emplace(keys, std::vector<Rule>()).first;
+      fill(dictionary, known->second);
+    }
+    lastKeys_ = known->first;
+    last_ = &known->second;
+    return *last_;
   }
 
  private:
+  // Bounds the memory that a file of ever new layouts can take.
+  static constexpr std::size_t kMostLayouts = 1024;
+
+  void fill(const Value& dictionary, std::vector<Rule>& rules) const {
+    const DictionaryView fields = dictionary.dictionaryValue();
+    rules.clear();
+    for (std::size_t i = 0; i < fields.size(); ++i) rules.push_back(ruleOf(fields.keyAt(i)));
+  }
   Rule ruleOf(std::string_view key) const {
     for (std::size_t i = 0; i < count_; ++i) {
       if (rules_[i].key == key) return rules_[i].rule;
@@ -95,8 +116,34 @@ class RuleTable {
 
   const KeyRule* rules_;
   std::size_t count_;
-  std::vector<std::uint8_t> known_;  // by object index: rule + 1, 0 when not seen yet
+  std::unordered_map<std::string, std::vector<Rule>> layouts_;  // by key objects
+  std::string_view lastKeys_;                                   // views a key of layouts_
+  const std::vector<Rule>* last_ = nullptr;
+  std::vector<Rule> scratch_;
 };
+
+// Whether a look at an entry is enough to let it pass. What does not pass is checked again.
+bool passesAtSight(Rule rule, const EntryPeek& entry) {
+  switch (rule) {
+    case Rule::kAnything:
+      return true;
+    case Rule::kUuid:
+    case Rule::kItemType:
+    case Rule::kString:
+      return entry.kind() == Kind::kString;
+    case Rule::kNumber:
+      return entry.kind() == Kind::kNumber;
+    case Rule::kFiniteNumber:
+      return entry.kind() == Kind::kNumber &&
+             (!entry.number().isReal() || std::isfinite(entry.number().doubleValue()));
+    case Rule::kArray:
+      return entry.kind() == Kind::kArray;
+    case Rule::kDictionary:
+      return entry.kind() == Kind::kDictionary;
+    default:
+      return false;
+  }
+}
 
 // Raised within this file alone, with the text for people.
 struct Refusal {
@@ -130,10 +177,7 @@ class Checker {
     if (value.isNull()) return;
     const ArrayView items = value.arrayValue();
     if (items.size() > limits::kAssets + limits::kContainers) overLimit("items", items.size());
-    if (areUpdates) {
-      result_.assetUUIDs.reserve(items.size());
-      result_.identifiers.reserve(items.size());
-    }
+    if (areUpdates) result_.assetUUIDs.reserve(items.size());
     list_ = list;
     for (index_ = 0; index_ < items.size(); ++index_) checkItem(items[index_], areUpdates);
   }
@@ -143,16 +187,12 @@ class Checker {
     if (!item.isDictionary()) {
       refuse("expected dictionary, found " + std::string(kindName(item.kind())));
     }
-    const DictionaryView fields = item.dictionaryValue();
-    uuid_ = Value();
-    type_ = Value();
-    for (std::size_t i = 0; i < fields.size(); ++i) {
-      const Rule rule = itemRules_.ruleAt(fields, i);
-      if (rule != Rule::kAnything) checkField(rule, fields.keyAt(i), fields.valueAt(i));
-    }
-    if (type_.isNull()) refuse("it has no \"itemType\"");
-    if (uuid_.isNull()) refuse("it has no \"uuid\"");
-    const std::string_view type = type_.stringValue();
+    uuid_.reset();
+    type_.reset();
+    checkFields(itemRules_, item);
+    if (!type_) refuse("it has no \"itemType\"");
+    if (!uuid_) refuse("it has no \"uuid\"");
+    const std::string_view type = *type_;
     const bool isAsset = type == "Asset";
     if (!isAsset && type != "Album" && type != "Event") {
       refuse("unknown \"itemType\" \"" + std::string(type.substr(0, 64)) + "\"");
@@ -163,13 +203,11 @@ class Checker {
   }
 
   void note(bool isAsset) {
-    if (uuid_.stringValue().empty()) return;
-    result_.identifiers.push_back(uuid_);
-    const std::string_view uuid = result_.identifiers.back().stringValue();
+    if (uuid_->empty()) return;
     if (isAsset) {
-      result_.assetUUIDs.insert(uuid);
+      result_.assetUUIDs.insert(*uuid_);
     } else {
-      result_.containerUUIDs.push_back(uuid);
+      result_.containerUUIDs.push_back(*uuid_);
     }
   }
 
@@ -179,11 +217,11 @@ class Checker {
         return;
       case Rule::kUuid:
         require(value, Kind::kString, key);
-        uuid_ = value;
+        uuid_ = value.stringValue();
         return;
       case Rule::kItemType:
         require(value, Kind::kString, key);
-        type_ = value;
+        type_ = value.stringValue();
         return;
       case Rule::kString:
         return require(value, Kind::kString, key);
@@ -209,8 +247,10 @@ class Checker {
     const ArrayView members = value.arrayValue();
     memberships_ += members.size();
     count(memberships_, limits::kMemberships, "album members");
-    for (const Value& member : members) {
-      if (!member.isString()) mismatch(key, "array of strings", member.kind());
+    const bool canPeek = EntryPeek::can(value);
+    for (std::size_t i = 0; i < members.size(); ++i) {
+      const Kind kind = canPeek ? EntryPeek::elementOf(value, i).kind() : members[i].kind();
+      if (kind != Kind::kString) mismatch(key, "array of strings", kind);
     }
   }
 
@@ -221,19 +261,29 @@ class Checker {
     count(faces_, limits::kFaces, "faces");
     for (const Value& face : faces) {
       if (!face.isDictionary()) mismatch(key, "array of dictionaries", face.kind());
-      checkFields(faceRules_, face.dictionaryValue());
+      checkFields(faceRules_, face);
     }
   }
 
   void checkRectangle(const Value& value, std::string_view key) {
     require(value, Kind::kDictionary, key);
-    checkFields(rectangleRules_, value.dictionaryValue());
+    checkFields(rectangleRules_, value);
   }
 
-  void checkFields(RuleTable& rules, const DictionaryView& fields) {
-    for (std::size_t i = 0; i < fields.size(); ++i) {
-      const Rule rule = rules.ruleAt(fields, i);
-      if (rule != Rule::kAnything) checkField(rule, fields.keyAt(i), fields.valueAt(i));
+  void checkFields(RuleTable& table, const Value& dictionary) {
+    const std::vector<Rule>& rules = table.rulesOf(dictionary);
+    const bool canPeek = EntryPeek::can(dictionary);
+    for (std::size_t i = 0; i < rules.size(); ++i) {
+      if (canPeek) {
+        const EntryPeek entry = EntryPeek::valueOf(dictionary, i);
+        if (passesAtSight(rules[i], entry)) {
+          if (rules[i] == Rule::kUuid) uuid_ = entry.text();
+          if (rules[i] == Rule::kItemType) type_ = entry.text();
+          continue;
+        }
+      }
+      const DictionaryView fields = dictionary.dictionaryValue();
+      checkField(rules[i], fields.keyAt(i), fields.valueAt(i));
     }
   }
 
@@ -266,7 +316,7 @@ class Checker {
     std::string place(where_);
     if (place.empty()) {
       place = std::string(list_) + "[" + std::to_string(index_) + "]";
-      if (uuid_.isString()) place += " (" + std::string(uuid_.stringValue().substr(0, 64)) + ")";
+      if (uuid_) place += " (" + std::string(uuid_->substr(0, 64)) + ")";
     }
     throw Refusal{"in " + place + ": " + what};
   }
@@ -279,8 +329,9 @@ class Checker {
   std::string_view where_;
   std::string_view list_;
   std::size_t index_ = 0;
-  Value uuid_;
-  Value type_;
+  // Of the item under check: views of texts that the root keeps alive.
+  OptionalString uuid_;
+  OptionalString type_;
   std::uint64_t assets_ = 0, containers_ = 0, memberships_ = 0, faces_ = 0;
 };
 

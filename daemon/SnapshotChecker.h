@@ -13,14 +13,13 @@
 
 namespace kx {
 
-// What the checks that compare a snapshot with a device need of it. Identifiers are views of the
-// texts that `identifiers` keeps alive.
+// What the checks that compare a snapshot with a device need of it. Identifiers are views of texts
+// of `root`; "" counts nowhere and is left out.
 struct CheckedSnapshot {
   Value root;
   std::string libraryUUID;
-  std::vector<Value> identifiers;
-  std::unordered_set<std::string_view> assetUUIDs;  // "" counts nowhere and is left out
-  std::vector<std::string_view> containerUUIDs;     // albums and events, in file order
+  std::unordered_set<std::string_view> assetUUIDs;
+  std::vector<std::string_view> containerUUIDs;  // albums and events, in file order
 };
 
 // Checks a snapshot whole, before anything is done with it: it is a property list within the

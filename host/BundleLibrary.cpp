@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <mutex>
+#include <system_error>
 #include <utility>
 
 #include "host/FolderScan.h"
@@ -32,7 +33,6 @@ class BundleLibrary final : public HostLibrary {
     if (failure != 0) return fail(failure, kBundleSnapshotName, error);
     snapshot_ = std::make_shared<Data>(std::move(bytes));
     failure = openBeneath(folder_.get(), kBundleMediaName, O_RDONLY | O_DIRECTORY, &media_);
-    if (failure == 0) failure = listNames(media_.get(), &names_);
     return failure == 0 || fail(failure, kBundleMediaName, error);
   }
 
@@ -46,7 +46,8 @@ class BundleLibrary final : public HostLibrary {
   std::optional<HostMedia> openMedia(std::string_view uuid, ErrorPtr* error) const override {
     const std::string name = nameOf(uuid);
     if (name.empty()) {
-      setError(error, posixError(ENOENT, "no file of the host"));
+      const int failure = names().failure;
+      setError(error, posixError(failure != 0 ? failure : ENOENT, "no file of the host"));
       return std::nullopt;
     }
     std::optional<HostMedia> media = openHostMedia(media_.get(), name, error);
@@ -65,8 +66,11 @@ class BundleLibrary final : public HostLibrary {
 
   // A name's UUID is what stands before its first dot.
   std::vector<MediaName> mediaNames() const override {
+    if (names().failure != 0) {
+      throw std::system_error(names().failure, std::generic_category(), kBundleMediaName);
+    }
     std::vector<MediaName> result;
-    for (const std::string& name : names_) {
+    for (const std::string& name : names().sorted) {
       if (name.front() == '.') continue;
       std::string uuid = name.substr(0, name.find('.'));
       if (nameOf(uuid) == name) result.push_back({std::move(uuid), name});
@@ -81,14 +85,26 @@ class BundleLibrary final : public HostLibrary {
     return false;
   }
 
+  struct Names {
+    std::vector<std::string> sorted;  // by bytes
+    int failure = 0;                  // errno when they could not be listed
+  };
+
+  // The names in media/, listed when first asked for: a sync without new files never does.
+  const Names& names() const {
+    std::call_once(listed_, [this] { names_.failure = listNames(media_.get(), &names_.sorted); });
+    return names_;
+  }
+
   // The name of the asset's file in media/, "" when there is none.
   std::string nameOf(std::string_view uuid) const {
     if (!isOneComponent(uuid)) return {};
+    const std::vector<std::string>& sorted = names().sorted;
     const std::string exact(uuid);
-    if (std::binary_search(names_.begin(), names_.end(), exact)) return exact;
+    if (std::binary_search(sorted.begin(), sorted.end(), exact)) return exact;
     const std::string prefix = exact + ".";
-    const auto found = std::lower_bound(names_.begin(), names_.end(), prefix);
-    return found != names_.end() && found->starts_with(prefix) ? *found : std::string();
+    const auto found = std::lower_bound(sorted.begin(), sorted.end(), prefix);
+    return found != sorted.end() && found->starts_with(prefix) ? *found : std::string();
   }
 
   std::string rootText(std::string_view key) const {
@@ -100,9 +116,10 @@ class BundleLibrary final : public HostLibrary {
   std::string path_;
   FileHandle folder_;
   FileHandle media_;
-  std::vector<std::string> names_;  // in media/, sorted by bytes
   DataPtr snapshot_;
   std::vector<HostProblem> problems_;
+  mutable std::once_flag listed_;
+  mutable Names names_;
   mutable std::once_flag decoded_;
   mutable Value root_;
 };

@@ -2,9 +2,11 @@
 #include <vector>
 
 #include "daemon/Ferrule.h"
+#include "daemon/ProcessMemory.h"
 #include "daemon/drive/DriveConsole.h"
 
 int main(int count, char** values) {
+  kx::keepFreedMemory();
   return kx::runFerrule(
       std::vector<std::string>(values + 1, values + count),
       {{"drive",
