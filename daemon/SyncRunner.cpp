@@ -1,6 +1,7 @@
 #include "daemon/SyncRunner.h"
 
 #include <cerrno>
+#include <utility>
 
 #include "daemon/SyncSession.h"
 #include "platform/foundation/Text.h"
@@ -51,9 +52,9 @@ SyncResult SyncRunner::run(HostLink& host, ReferenceDevice& device, const SyncOp
                            const SyncProgressCallback& progress, const CancelToken& cancel) {
   return catching([&] {
     ErrorPtr error;
-    const auto snapshot = readHostSnapshot(host, &error);
+    auto snapshot = readHostSnapshot(host, &error);
     if (!snapshot) return failedResult(error, kExitFailed);
-    return SyncSession({host, device, options, progress, cancel}, *snapshot).run();
+    return SyncSession({host, device, options, progress, cancel}, std::move(*snapshot)).run();
   });
 }
 
@@ -62,7 +63,7 @@ SyncResult syncDevice(HostLink& host, const SyncOptions& options, const LogSinks
   return catching([&] {
     // A host that cannot be read must not make a device.
     ErrorPtr error;
-    const auto snapshot = readHostSnapshot(host, &error);
+    auto snapshot = readHostSnapshot(host, &error);
     if (!snapshot) return failedResult(error, kExitFailed);
     DeviceOptions deviceOptions;
     deviceOptions.root = options.deviceRoot;
@@ -70,7 +71,7 @@ SyncResult syncDevice(HostLink& host, const SyncOptions& options, const LogSinks
     deviceOptions.logs = logs;
     const auto device = ReferenceDevice::open(deviceOptions, &error);
     if (!device) return failedResult(error, exitCodeForDeviceError(error));
-    return SyncSession({host, *device, options, progress, cancel}, *snapshot).run();
+    return SyncSession({host, *device, options, progress, cancel}, std::move(*snapshot)).run();
   });
 }
 
@@ -79,7 +80,7 @@ SyncPlan planSync(HostLink& host, const SyncOptions& options, const LogSinks& lo
   SyncPlan plan;
   plan.result = catching([&] {
     ErrorPtr error;
-    const auto snapshot = readHostSnapshot(host, &error);
+    auto snapshot = readHostSnapshot(host, &error);
     if (!snapshot) return failedResult(error, kExitFailed);
     DeviceOptions deviceOptions;
     deviceOptions.root = options.deviceRoot;
@@ -87,7 +88,8 @@ SyncPlan planSync(HostLink& host, const SyncOptions& options, const LogSinks& lo
     deviceOptions.logs = logs;
     const auto device = ReferenceDevice::open(deviceOptions, &error);
     if (!device) return failedResult(error, exitCodeForDeviceError(error));
-    return SyncSession({host, *device, options, progress, cancel, &plan}, *snapshot).run();
+    return SyncSession({host, *device, options, progress, cancel, &plan}, std::move(*snapshot))
+        .run();
   });
   return plan;
 }

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <csignal>
+#include <utility>
 
 #include "daemon/PlannedTransfers.h"
 #include "daemon/RunErrors.h"
@@ -50,9 +51,9 @@ std::optional<HostSnapshot> readHostSnapshot(HostLink& host, ErrorPtr* error) {
   return snapshot;
 }
 
-SyncSession::SyncSession(const Context& context, const HostSnapshot& snapshot)
+SyncSession::SyncSession(const Context& context, HostSnapshot snapshot)
     : context_(context),
-      snapshot_(snapshot),
+      snapshot_(std::move(snapshot)),
       files_(context.device.platform().files()),
       librarySwitch_(files_),
       startedAt_(context.device.platform().clock().absoluteTime()) {}
@@ -91,10 +92,13 @@ ErrorPtr SyncSession::checkAgainstDevice() {
 
 // Whether the host's snapshot is, byte for byte, the one that the device sealed last.
 bool SyncSession::matchesSeal() {
-  if (!files_.fileExists(KXPreviousMetadataSyncFilePath)) return false;
+  if (matchesSeal_) return *matchesSeal_;
   ErrorPtr ignored;
-  const DataPtr last = files_.readFile(KXPreviousMetadataSyncFilePath, &ignored);
-  return last && last->isEqualToData(*snapshot_.bytes);
+  const DataPtr last = files_.fileExists(KXPreviousMetadataSyncFilePath)
+                           ? files_.readFile(KXPreviousMetadataSyncFilePath, &ignored)
+                           : nullptr;
+  matchesSeal_ = last && last->isEqualToData(*snapshot_.bytes);
+  return *matchesSeal_;
 }
 
 bool SyncSession::checkBeforeFirstEffect() {
@@ -205,6 +209,7 @@ bool SyncSession::predictResync() {
 }
 
 void SyncSession::transferAndEnd() {
+  snapshot_ = {};  // it has served, and of a large library it is a good part of our memory
   enter(context_.plan ? SyncPhase::kPlanning : SyncPhase::kTransferring);
   const bool allArrived = transfer();
   enter(SyncPhase::kFinishing);

@@ -34,7 +34,7 @@ class SyncSession {
     const CancelToken& cancel;
     SyncPlan* plan = nullptr;  // set: the device keeps nothing, and no file is moved
   };
-  SyncSession(const Context& context, const HostSnapshot& snapshot);
+  SyncSession(const Context& context, HostSnapshot snapshot);
 
   SyncResult run();
 
@@ -67,7 +67,8 @@ class SyncSession {
   void failCall(SyncErrorCode code, const std::string& call, const ErrorPtr& error);
 
   Context context_;
-  const HostSnapshot& snapshot_;
+  HostSnapshot snapshot_;  // up to the end of the reconcile
+  std::optional<bool> matchesSeal_;
   FileSystem& files_;
   LibrarySwitch librarySwitch_;
   std::unique_ptr<PluginHost> plugin_;
