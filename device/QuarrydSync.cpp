@@ -13,16 +13,11 @@ namespace {
 // Host dates count from 1904-01-01, ours from 2001-01-01.
 constexpr double kHostDateOffset = 3061152000.0;
 
-using ModificationDates = std::unordered_map<std::string, double>;
+// By identifier; the texts are those of the property list that they come from.
+using ModificationDates = std::unordered_map<std::string_view, double>;
 
 // What the snapshot says of each asset; null, and why, when it makes no sense.
-std::optional<ModificationDates> assetsOfSnapshot(const DataPtr& snapshot, std::string* why) {
-  ErrorPtr error;
-  const Value root = readPropertyList(snapshot, &error);
-  if (!root.isDictionary()) {
-    *why = error ? error->description() : "the snapshot is no dictionary";
-    return std::nullopt;
-  }
+std::optional<ModificationDates> assetsOfSnapshot(const Value& root, std::string* why) {
   try {
     ModificationDates dates;
     const std::optional<ArrayView> updates = root["updates"].asArray("updates");
@@ -32,7 +27,7 @@ std::optional<ModificationDates> assetsOfSnapshot(const DataPtr& snapshot, std::
       const OptionalString uuid = item["uuid"].asString("uuid");
       if (!uuid) continue;
       const auto modified = item["modificationDate"].asNumber("modificationDate");
-      dates[std::string(*uuid)] = (modified ? modified->doubleValue() : 0.0) - kHostDateOffset;
+      dates[*uuid] = (modified ? modified->doubleValue() : 0.0) - kHostDateOffset;
     }
     return dates;
   } catch (const TypeError& problem) {
@@ -89,8 +84,13 @@ std::optional<std::string> Quarryd::whyNotWhole(const DataPtr& snapshot) {
   LibraryStore& store = *parts_.store;
   if (restoring_) return "a restore is under way";
   if (store.health().anyFailure()) return "something failed since the sync began";
+  ErrorPtr unreadable;
+  const Value root = readPropertyList(snapshot, &unreadable);
+  if (!root.isDictionary()) {
+    return unreadable ? unreadable->description() : "the snapshot is no dictionary";
+  }
   std::string why;
-  std::optional<ModificationDates> wanted = assetsOfSnapshot(snapshot, &why);
+  std::optional<ModificationDates> wanted = assetsOfSnapshot(root, &why);
   if (!wanted) return why;
   std::optional<std::string> found;
   store.queue().sync([&] {
@@ -99,19 +99,19 @@ std::optional<std::string> Quarryd::whyNotWhole(const DataPtr& snapshot) {
                           "SELECT uuid, modification_date, incomplete FROM assets "
                           "WHERE saved_type = 256");
       while (row.step()) {
-        const auto expected = wanted->find(row.textAt(0));
+        const auto expected = wanted->find(row.textViewAt(0));
         if (expected == wanted->end()) continue;
         if (row.integerAt(2) != 0) {
-          found = expected->first + " is incomplete";
+          found = std::string(expected->first) + " is incomplete";
           return;
         }
         if (row.optionalRealAt(1) != std::optional<double>(expected->second)) {
-          found = expected->first + " has another modification date";
+          found = std::string(expected->first) + " has another modification date";
           return;
         }
         wanted->erase(expected);
       }
-      if (!wanted->empty()) found = wanted->begin()->first + " is not in the library";
+      if (!wanted->empty()) found = std::string(wanted->begin()->first) + " is not in the library";
     } catch (const SqliteError& error) {
       found = error.what();
     }
