@@ -8,7 +8,7 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <functional>
+#include <cstring>
 
 #include "device/DeviceErrors.h"
 #include "platform/foundation/Text.h"
@@ -32,7 +32,8 @@ class HeldLock : public FileLock {
 struct Level {
   std::unique_ptr<DIR, int (*)(DIR*)> stream{nullptr, &::closedir};
   FileProperties entry;            // what its entries have in common, and the entry in hand
-  std::vector<std::string> names;  // sorted from the end, so that the next one is the last
+  std::string text;                // the names, each with its NUL
+  std::vector<std::size_t> names;  // where they begin, sorted from the end: the next is the last
 };
 
 int openLevel(const DeviceRoot& root, const std::string& path, Level* level) {
@@ -48,11 +49,16 @@ int openLevel(const DeviceRoot& root, const std::string& path, Level* level) {
   errno = 0;
   while (const dirent* found = ::readdir(level->stream.get())) {
     const std::string_view name = found->d_name;
-    if (name != "." && name != "..") level->names.emplace_back(name);
+    if (name != "." && name != "..") {
+      level->names.push_back(level->text.size());
+      level->text.append(name).push_back('\0');
+    }
     errno = 0;
   }
   if (errno != 0) return errno;
-  std::sort(level->names.begin(), level->names.end(), std::greater<>());
+  const char* text = level->text.c_str();
+  std::sort(level->names.begin(), level->names.end(),
+            [text](std::size_t a, std::size_t b) { return std::strcmp(text + a, text + b) > 0; });
   level->entry.parentPath = path;
   level->entry.parentResourceIdentifier = identifierOf(status);
   return 0;
@@ -118,7 +124,7 @@ void DeviceFileSystem::enumerate(const std::string& path, const EntryHandler& on
       continue;
     }
     FileProperties& entry = level.entry;
-    entry.name = std::move(level.names.back());
+    entry.name.assign(level.text.c_str() + level.names.back());
     level.names.pop_back();
     entry.path.assign(entry.parentPath);
     if (entry.path.back() != '/') entry.path += '/';
