@@ -52,7 +52,7 @@ SyncResult SyncRunner::run(HostLink& host, ReferenceDevice& device, const SyncOp
                            const SyncProgressCallback& progress, const CancelToken& cancel) {
   return catching([&] {
     ErrorPtr error;
-    auto snapshot = readHostSnapshot(host, &error);
+    auto snapshot = readHostSnapshot(host, options.deviceRoot, &error);
     if (!snapshot) return failedResult(error, kExitFailed);
     return SyncSession({host, device, options, progress, cancel}, std::move(*snapshot)).run();
   });
@@ -63,7 +63,7 @@ SyncResult syncDevice(HostLink& host, const SyncOptions& options, const LogSinks
   return catching([&] {
     // A host that cannot be read must not make a device.
     ErrorPtr error;
-    auto snapshot = readHostSnapshot(host, &error);
+    auto snapshot = readHostSnapshot(host, options.deviceRoot, &error);
     if (!snapshot) return failedResult(error, kExitFailed);
     DeviceOptions deviceOptions;
     deviceOptions.root = options.deviceRoot;
@@ -80,7 +80,7 @@ SyncPlan planSync(HostLink& host, const SyncOptions& options, const LogSinks& lo
   SyncPlan plan;
   plan.result = catching([&] {
     ErrorPtr error;
-    auto snapshot = readHostSnapshot(host, &error);
+    auto snapshot = readHostSnapshot(host, options.deviceRoot, &error);
     if (!snapshot) return failedResult(error, kExitFailed);
     DeviceOptions deviceOptions;
     deviceOptions.root = options.deviceRoot;

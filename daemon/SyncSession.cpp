@@ -1,5 +1,7 @@
 #include "daemon/SyncSession.h"
 
+#include <sys/stat.h>
+
 #include <algorithm>
 #include <csignal>
 #include <utility>
@@ -31,9 +33,17 @@ std::size_t countWithout(const std::set<std::string>& counted, const std::set<st
                     [&](const std::string& uuid) { return !left.contains(uuid); }));
 }
 
+// A hint from outside the device, which is not open yet: the sealed snapshot is as long.
+bool mayBeSealed(const Data& bytes, const std::string& deviceRoot) {
+  struct stat status;
+  return ::lstat((deviceRoot + KXPreviousMetadataSyncFilePath).c_str(), &status) == 0 &&
+         static_cast<std::uint64_t>(status.st_size) == bytes.span().size();
+}
+
 }  // namespace
 
-std::optional<HostSnapshot> readHostSnapshot(HostLink& host, ErrorPtr* error) {
+std::optional<HostSnapshot> readHostSnapshot(HostLink& host, const std::string& deviceRoot,
+                                             ErrorPtr* error) {
   HostSnapshot snapshot;
   ErrorPtr problem;
   snapshot.bytes = host.snapshot(&problem);
@@ -45,9 +55,9 @@ std::optional<HostSnapshot> readHostSnapshot(HostLink& host, ErrorPtr* error) {
     setError(error, problem);
     return std::nullopt;
   }
-  auto checked = checkSnapshot(snapshot.bytes, error);
-  if (!checked) return std::nullopt;
-  snapshot.checked = std::move(*checked);
+  if (mayBeSealed(*snapshot.bytes, deviceRoot)) return snapshot;
+  snapshot.checked = checkSnapshot(snapshot.bytes, error);
+  if (!snapshot.checked) return std::nullopt;
   return snapshot;
 }
 
@@ -69,18 +79,22 @@ SyncResult SyncSession::run() {
 }
 
 ErrorPtr SyncSession::checkAgainstDevice() {
+  ErrorPtr error;
+  if (!snapshot_.checked) snapshot_.checked = checkSnapshot(snapshot_.bytes, &error);
+  if (!snapshot_.checked) return error;
+  const CheckedSnapshot& checked = *snapshot_.checked;
   DeviceComparison comparison;
-  ErrorPtr error = compareWithDevice(snapshot_.checked, context_.device.platform(), &comparison);
+  error = compareWithDevice(checked, context_.device.platform(), &comparison);
   if (!error) error = refuseDeviceMadeContainers(comparison);
   if (error) return error;
   std::optional<GuardFacts> guard;
   if (!context_.options.allowDeletes) {
-    guard = guardAgainstDeletes(snapshot_.checked, comparison, context_.device);
+    guard = guardAgainstDeletes(checked, comparison, context_.device);
   }
   if (guard) error = guardError(*guard);
   if (error && !context_.plan) return error;
-  const auto space = refuseWithoutSpace(snapshot_.checked, comparison, context_.host,
-                                        context_.device, context_.options);
+  const auto space =
+      refuseWithoutSpace(checked, comparison, context_.host, context_.device, context_.options);
   if (space && !error) error = spaceError(*space);
   if (!context_.plan) return error;
   // A plan goes on, to say what would be done.
@@ -102,8 +116,8 @@ bool SyncSession::matchesSeal() {
 }
 
 bool SyncSession::checkBeforeFirstEffect() {
-  // These very bytes have been synced whole: everything unlisted is gone since, and everything
-  // listed is there.
+  // These very bytes have been checked and synced whole: everything unlisted is gone since, and
+  // everything listed is there.
   ErrorPtr error = matchesSeal() ? nullptr : checkAgainstDevice();
   std::shared_ptr<PluginModule> module = context_.options.plugin;
   if (!error && !module) module = PluginModule::load(context_.options.pluginPath, &error);
@@ -163,8 +177,11 @@ bool SyncSession::reconcile() {
   enter(SyncPhase::kReconciling);
   const bool isResync = predictResync();
   const bool hadLastSynced = files_.fileExists(KXPreviousMetadataSyncFilePath);
-  if (const ErrorPtr error = librarySwitch_.begin(snapshot_.checked.libraryUUID)) {
-    fail(prefixed("the name of the library before cannot be kept", *error));
+  // What is sealed belongs to the library that the device knows already.
+  const ErrorPtr kept =
+      matchesSeal() ? nullptr : librarySwitch_.begin(snapshot_.checked->libraryUUID);
+  if (kept) {
+    fail(prefixed("the name of the library before cannot be kept", *kept));
     endWithoutTransfers();
     return false;
   }
@@ -205,7 +222,7 @@ bool SyncSession::predictResync() {
   if (!known.isString()) {
     known = readDevicePropertyList(files_, kKXCurrentLibraryUUIDPath)["libraryUUID"];
   }
-  return !known.isString() || known.stringValue() != snapshot_.checked.libraryUUID;
+  return !known.isString() || known.stringValue() != snapshot_.checked->libraryUUID;
 }
 
 void SyncSession::transferAndEnd() {

@@ -15,12 +15,14 @@
 
 namespace kx {
 
-// A host's snapshot, read and checked before a device is touched.
+// A host's snapshot. It is checked before a device is touched, but for one that may be the very
+// bytes that the device sealed last: that one the session checks when it turns out to be another.
 struct HostSnapshot {
   DataPtr bytes;
-  CheckedSnapshot checked;
+  std::optional<CheckedSnapshot> checked;
 };
-std::optional<HostSnapshot> readHostSnapshot(HostLink& host, ErrorPtr* error);
+std::optional<HostSnapshot> readHostSnapshot(HostLink& host, const std::string& deviceRoot,
+                                             ErrorPtr* error);
 
 // One run of a sync over an open device: the phases in order, each on top of what the ones before
 // found. Made for one run and used on one thread.

@@ -140,8 +140,12 @@ bool KXSLibraryChangeSnapshot::isEqualToSnapshot(const KXSLibraryChangeSnapshot*
 }
 
 bool KXSLibraryChangeSnapshot::isEqualToTwin() const {
-  if (!equalValues(libraryKind_, libraryKind_) || !equalValues(libraryUUID_, libraryUUID_)) {
-    logDifference("snapshot libraryKind or libraryUUID not equal");
+  if (!equalValues(libraryKind_, libraryKind_)) {
+    logDifference("snapshot libraryKind not equal");
+    return false;
+  }
+  if (!equalValues(libraryUUID_, libraryUUID_)) {
+    logDifference("snapshot libraryUUID not equal");
     return false;
   }
   static const KXSItemList kNoItems;

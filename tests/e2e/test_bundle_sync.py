@@ -62,6 +62,22 @@ class BundleSync(EndToEnd):
         self.assertEqual(self.counts(result), {})
         self.assertEqual(tree_hash(self.device), before)
 
+    def test_a_snapshot_as_long_as_the_sealed_one_is_checked_all_the_same(self):
+        items = self.library()
+        self.bundle(snapshot(items))
+        self.sync()
+        before = tree_hash(self.device)
+        path = os.path.join(self.host, "PhotoLibrary.plist")
+        with open(path, "rb") as file:
+            sealed = file.read()
+        damaged = sealed[:-40] + b"\xff" * 8 + sealed[-32:]
+        self.write(path, damaged)
+        self.assertEqual(self.sync(code=1)["outcome"], "failed")
+        self.assertEqual(tree_hash(self.device), before)
+        self.assertEqual(sealed.count(b"All"), 1)
+        self.write(path, sealed.replace(b"All", b"Few"))
+        self.assertEqual(self.counts(self.sync()), {"albumsRenamed": 1})
+
     def test_assets_without_a_place_are_no_null_sync_but_nothing_changes(self):
         self.bundle(snapshot([asset(uid(0)), album(uid("a"), "A", [uid(0)])]))
         self.sync()
