@@ -102,7 +102,7 @@ TEST_F(AlbumReconciliationTest, AThumbnailFailureWithoutErrorIsNotLogged) {
 }
 
 TEST_F(AlbumReconciliationTest, AThumbnailNameLeadsOutOfNoDirectory) {
-  const std::string hostile = "../../DCIM/100APPLE/IMG_1";
+  const std::string hostile = "../../DCIM/100CAMRA/IMG_1";
   addAlbum(hostile, "Ann", {}, kKXAlbumKindSyncedFaceAlbum);
   platform.memoryFiles.putText(thumbnail(hostile), "the user's own");
   EXPECT_TRUE(reconcile(SnapshotBuilder()));

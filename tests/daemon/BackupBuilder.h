@@ -18,7 +18,7 @@ class BackupBuilder {
   BackupManifest& manifest() { return manifest_; }
   std::vector<BackupAlbum>& albums() { return albums_; }
 
-  // A camera file, "100APPLE/IMG_0001.JPG"; its device path.
+  // A camera file, "100CAMRA/IMG_0001.JPG"; its device path.
   std::string add(const std::string& name, const std::string& content);
   // A file's content in the backup, without a word in the manifest.
   void putContent(const std::string& name, const std::string& content) const;

@@ -35,11 +35,11 @@ class RestoreTest : public testing::Test {
     options.reserveBytes = 0;
   }
   void fill(BackupBuilder& builder) const {
-    builder.add("100APPLE/IMG_0001.JPG", kJpeg + "1");
-    builder.add("100APPLE/IMG_0001.MOV", "film 1");
-    builder.add("100APPLE/IMG_0002.JPG", kJpeg + "2");
-    builder.add("101APPLE/IMG_0003.JPG", kJpeg + "3");
-    builder.album("ALBUM", {"101APPLE/IMG_0003.JPG", "100APPLE/IMG_0001.JPG"});
+    builder.add("100CAMRA/IMG_0001.JPG", kJpeg + "1");
+    builder.add("100CAMRA/IMG_0001.MOV", "film 1");
+    builder.add("100CAMRA/IMG_0002.JPG", kJpeg + "2");
+    builder.add("101CAMRA/IMG_0003.JPG", kJpeg + "3");
+    builder.album("ALBUM", {"101CAMRA/IMG_0003.JPG", "100CAMRA/IMG_0001.JPG"});
     builder.write();
   }
   RestoreResult restore(const BackupBuilder& builder) {
@@ -106,9 +106,9 @@ TEST_F(RestoreTest, ANewDeviceGetsFilesPhotosAndAlbums) {
   EXPECT_EQ(result.registered, 3U);
   EXPECT_EQ(result.albumsCreated, 1U);
   EXPECT_EQ(result.library, RestoreLibrary::kNone);
-  EXPECT_EQ(read("100APPLE/IMG_0001.MOV"), "film 1");
+  EXPECT_EQ(read("100CAMRA/IMG_0001.MOV"), "film 1");
   struct stat status;
-  ASSERT_EQ(::stat(work.at(onDevice("101APPLE/IMG_0003.JPG")).c_str(), &status), 0);
+  ASSERT_EQ(::stat(work.at(onDevice("101CAMRA/IMG_0003.JPG")).c_str(), &status), 0);
   EXPECT_EQ(status.st_mtim.tv_sec, 978307200 + 600000000);
   EXPECT_EQ(status.st_mtim.tv_nsec, 250000000);
   const DeviceDump all = dump();
@@ -136,12 +136,12 @@ TEST_F(RestoreTest, ALostFileComesBackAlone) {
   BackupBuilder backup(work);
   fill(backup);
   restore(backup);
-  fs::remove(work.at(onDevice("100APPLE/IMG_0002.JPG")));
+  fs::remove(work.at(onDevice("100CAMRA/IMG_0002.JPG")));
   const RestoreResult again = restore(backup);
   EXPECT_EQ(again.outcome, RestoreOutcome::kRestored);
   EXPECT_EQ(again.restored, 1U);
   EXPECT_EQ(again.registered, 0U);
-  EXPECT_EQ(read("100APPLE/IMG_0002.JPG"), kJpeg + "2");
+  EXPECT_EQ(read("100CAMRA/IMG_0002.JPG"), kJpeg + "2");
   expectAtRest();
 }
 
@@ -155,9 +155,9 @@ TEST_F(RestoreTest, AnEmptyBackupIsNothingToDo) {
 TEST_F(RestoreTest, DamagedAndMissingFilesFailAloneAndByName) {
   BackupBuilder backup(work);
   fill(backup);
-  backup.putContent("100APPLE/IMG_0001.JPG", kJpeg + "X");   // same size
-  backup.putContent("100APPLE/IMG_0001.MOV", "film 1 and");  // longer
-  fs::remove(backup.path() + "/DCIM/101APPLE/IMG_0003.JPG");
+  backup.putContent("100CAMRA/IMG_0001.JPG", kJpeg + "X");   // same size
+  backup.putContent("100CAMRA/IMG_0001.MOV", "film 1 and");  // longer
+  fs::remove(backup.path() + "/DCIM/101CAMRA/IMG_0003.JPG");
   const RestoreResult result = restore(backup);
   EXPECT_EQ(result.outcome, RestoreOutcome::kPartial);
   EXPECT_EQ(result.exitCode, kExitPartial);
@@ -167,14 +167,14 @@ TEST_F(RestoreTest, DamagedAndMissingFilesFailAloneAndByName) {
     EXPECT_EQ(failure.domain, kFRErrorDomain);
     EXPECT_THAT(failure.reason, HasSubstr("in the backup"));
   }
-  EXPECT_FALSE(work.exists(onDevice("100APPLE/IMG_0001.JPG")));
-  EXPECT_FALSE(work.exists(onDevice("100APPLE/IMG_0001.MOV")));
-  EXPECT_EQ(read("100APPLE/IMG_0002.JPG"), kJpeg + "2");
+  EXPECT_FALSE(work.exists(onDevice("100CAMRA/IMG_0001.JPG")));
+  EXPECT_FALSE(work.exists(onDevice("100CAMRA/IMG_0001.MOV")));
+  EXPECT_EQ(read("100CAMRA/IMG_0002.JPG"), kJpeg + "2");
   expectAtRest();
   // Once the backup is whole again the rest comes.
-  backup.putContent("100APPLE/IMG_0001.JPG", kJpeg + "1");
-  backup.putContent("100APPLE/IMG_0001.MOV", "film 1");
-  backup.putContent("101APPLE/IMG_0003.JPG", kJpeg + "3");
+  backup.putContent("100CAMRA/IMG_0001.JPG", kJpeg + "1");
+  backup.putContent("100CAMRA/IMG_0001.MOV", "film 1");
+  backup.putContent("101CAMRA/IMG_0003.JPG", kJpeg + "3");
   const RestoreResult again = restore(backup);
   EXPECT_EQ(again.outcome, RestoreOutcome::kRestored);
   EXPECT_EQ(again.restored, 3U);
@@ -183,9 +183,9 @@ TEST_F(RestoreTest, DamagedAndMissingFilesFailAloneAndByName) {
 }
 
 TEST_F(RestoreTest, AFileOfOtherContentStaysAndIsNamed) {
-  work.write(onDevice("100APPLE/IMG_0001.JPG"), kJpeg + "of the device");
-  work.write(onDevice("100APPLE/IMG_0002.JPG"), kJpeg + "2");
-  fs::create_directories(work.at(onDevice("101APPLE/IMG_0003.JPG")));
+  work.write(onDevice("100CAMRA/IMG_0001.JPG"), kJpeg + "of the device");
+  work.write(onDevice("100CAMRA/IMG_0002.JPG"), kJpeg + "2");
+  fs::create_directories(work.at(onDevice("101CAMRA/IMG_0003.JPG")));
   BackupBuilder backup(work);
   fill(backup);
   const RestoreResult result = restore(backup);
@@ -196,33 +196,33 @@ TEST_F(RestoreTest, AFileOfOtherContentStaysAndIsNamed) {
   }
   EXPECT_EQ(result.present, 1U);
   EXPECT_EQ(result.restored, 1U);
-  EXPECT_EQ(read("100APPLE/IMG_0001.JPG"), kJpeg + "of the device");
-  EXPECT_EQ(read("100APPLE/IMG_0001.MOV"), "film 1");
+  EXPECT_EQ(read("100CAMRA/IMG_0001.JPG"), kJpeg + "of the device");
+  EXPECT_EQ(read("100CAMRA/IMG_0001.MOV"), "film 1");
   expectAtRest();
 }
 
 TEST_F(RestoreTest, FilesThatThePlugInDoesNotAskForComeToo) {
   BackupBuilder backup(work);
-  backup.add("100APPLE/IMG_0001.JPG", kJpeg);
-  backup.add("100APPLE/.MISC/Info.plist", "hidden");
-  backup.add("100APPLE/README", "no extension");
+  backup.add("100CAMRA/IMG_0001.JPG", kJpeg);
+  backup.add("100CAMRA/.MISC/Info.plist", "hidden");
+  backup.add("100CAMRA/README", "no extension");
   backup.write();
   const RestoreResult result = restore(backup);
   EXPECT_EQ(result.outcome, RestoreOutcome::kRestored);
   EXPECT_EQ(result.requested, 1U);
   EXPECT_EQ(result.restored, 3U);
   EXPECT_EQ(result.registered, 1U);
-  EXPECT_EQ(read("100APPLE/.MISC/Info.plist"), "hidden");
+  EXPECT_EQ(read("100CAMRA/.MISC/Info.plist"), "hidden");
   EXPECT_EQ(restore(backup).outcome, RestoreOutcome::kNothing);
 }
 
 TEST_F(RestoreTest, LinksOnTheDeviceLeadNowhere) {
   fs::create_directories(work.at("outside"));
   fs::create_directories(work.at(onDevice("")));
-  fs::create_directory_symlink(work.at("outside"), work.at(onDevice("100APPLE")));
+  fs::create_directory_symlink(work.at("outside"), work.at(onDevice("100CAMRA")));
   work.write("outside/target", "target");
-  fs::create_directories(work.at(onDevice("101APPLE")));
-  fs::create_symlink(work.at("outside/target"), work.at(onDevice("101APPLE/IMG_0003.JPG")));
+  fs::create_directories(work.at(onDevice("101CAMRA")));
+  fs::create_symlink(work.at("outside/target"), work.at(onDevice("101CAMRA/IMG_0003.JPG")));
   BackupBuilder backup(work);
   fill(backup);
   const std::string outside = work.fingerprint("outside");
@@ -235,11 +235,11 @@ TEST_F(RestoreTest, LinksOnTheDeviceLeadNowhere) {
 TEST_F(RestoreTest, WhatIsNoFileInTheBackupFailsAloneAndByName) {
   BackupBuilder backup(work);
   fill(backup);
-  const std::string photo = backup.path() + "/DCIM/100APPLE/IMG_0001.JPG";
+  const std::string photo = backup.path() + "/DCIM/100CAMRA/IMG_0001.JPG";
   fs::rename(photo, work.at("elsewhere"));
   fs::create_symlink(work.at("elsewhere"), photo);
-  fs::remove(backup.path() + "/DCIM/100APPLE/IMG_0002.JPG");
-  ASSERT_EQ(::mkfifo((backup.path() + "/DCIM/100APPLE/IMG_0002.JPG").c_str(), 0600), 0);
+  fs::remove(backup.path() + "/DCIM/100CAMRA/IMG_0002.JPG");
+  ASSERT_EQ(::mkfifo((backup.path() + "/DCIM/100CAMRA/IMG_0002.JPG").c_str(), 0600), 0);
   const RestoreResult result = restore(backup);
   EXPECT_EQ(result.exitCode, kExitPartial);
   EXPECT_THAT(failedPaths(result), UnorderedElementsAre("IMG_0001.JPG", "IMG_0002.JPG"));
@@ -267,7 +267,7 @@ TEST_F(RestoreTest, ALostFileOfAPhotoThatIsKnownCompletesIt) {
 
 TEST_F(RestoreTest, FilesBeyondTheCameraAreRefused) {
   BackupBuilder backup(work);
-  backup.add("100APPLE/IMG_0001.JPG", kJpeg);
+  backup.add("100CAMRA/IMG_0001.JPG", kJpeg);
   const std::string elsewhere = "/var/mobile/Media/PhotoData/Photos.sqlite";
   BackupFile file = backup.manifest().files[0];
   file.path = elsewhere;
@@ -311,7 +311,7 @@ TEST_F(RestoreTest, ASignalStopsItAndTheNextRunGoesOn) {
   BackupBuilder backup(work);
   fill(backup);
   for (int i = 0; i < 400; ++i) {
-    backup.add("102APPLE/IMG_" + std::to_string(5000 + i) + ".JPG", kJpeg + std::to_string(i));
+    backup.add("102CAMRA/IMG_" + std::to_string(5000 + i) + ".JPG", kJpeg + std::to_string(i));
   }
   backup.write();
   progress = [this](const SyncProgress& state) {
@@ -353,9 +353,9 @@ TEST_F(RestoreTest, AnotherBackupBeginsAnew) {
   progress = {};
   cancel.cancel(0);
   BackupBuilder second(work, "second one");
-  second.add("100APPLE/IMG_0001.JPG", kJpeg + "1");
-  second.add("100APPLE/IMG_0009.JPG", kJpeg + "9");
-  second.album("OTHER", {"100APPLE/IMG_0009.JPG"});
+  second.add("100CAMRA/IMG_0001.JPG", kJpeg + "1");
+  second.add("100CAMRA/IMG_0009.JPG", kJpeg + "9");
+  second.album("OTHER", {"100CAMRA/IMG_0009.JPG"});
   second.write();
   const RestoreResult result = restore(second);
   EXPECT_EQ(result.outcome, RestoreOutcome::kRestored);
@@ -372,7 +372,7 @@ TEST_F(RestoreTest, NotesOfAnEarlierRestoreWithoutAMarkerAreForgotten) {
   const Value context =
       Value::dictionary({{"kKXSyncRestoreContextRestoredFilesKey",
                           Value::array({Value::string(std::string(device_paths::kDcim) +
-                                                      "/100APPLE/IMG_0002.JPG")})}});
+                                                      "/100CAMRA/IMG_0002.JPG")})}});
   const DataPtr bytes = plistBytes(context);
   work.write("device" + std::string(device_paths::kRestoreContext),
              std::string(bytes->span().begin(), bytes->span().end()));
@@ -382,7 +382,7 @@ TEST_F(RestoreTest, NotesOfAnEarlierRestoreWithoutAMarkerAreForgotten) {
 TEST_F(RestoreTest, AFileThatFailedBeforeAnInterruptionIsStillNamed) {
   BackupBuilder backup(work);
   fill(backup);
-  backup.putContent("100APPLE/IMG_0001.JPG", kJpeg + "X");
+  backup.putContent("100CAMRA/IMG_0001.JPG", kJpeg + "X");
   // The run before ended after it had noted every file.
   Array settled;
   for (const BackupFile& file : backup.manifest().files)
@@ -409,7 +409,7 @@ TEST_F(RestoreTest, ALockedDeviceIsLeftAlone) {
   const RestoreResult result = restore(backup);
   EXPECT_EQ(result.exitCode, kExitLocked);
   EXPECT_THAT(result.error->message(), HasSubstr("pid"));
-  EXPECT_FALSE(work.exists(onDevice("100APPLE")));
+  EXPECT_FALSE(work.exists(onDevice("100CAMRA")));
 }
 
 TEST_F(RestoreTest, WithoutRoomNothingIsBegun) {
@@ -419,7 +419,7 @@ TEST_F(RestoreTest, WithoutRoomNothingIsBegun) {
   const RestoreResult result = restore(backup);
   EXPECT_EQ(result.exitCode, kExitNoSpace);
   EXPECT_THAT(result.error->message(), HasSubstr("bytes needed"));
-  EXPECT_FALSE(work.exists(onDevice("100APPLE")));
+  EXPECT_FALSE(work.exists(onDevice("100CAMRA")));
   options.reserveBytes = 0;
   EXPECT_EQ(restore(backup).outcome, RestoreOutcome::kRestored);
 }
@@ -430,13 +430,13 @@ TEST_F(RestoreTest, ADatabaseThatKnowsEverythingIsTrusted) {
   {
     const auto device = open();
     for (const char* name :
-         {"100APPLE/IMG_0001.JPG", "100APPLE/IMG_0002.JPG", "101APPLE/IMG_0003.JPG"}) {
+         {"100CAMRA/IMG_0001.JPG", "100CAMRA/IMG_0002.JPG", "101CAMRA/IMG_0003.JPG"}) {
       NewDeviceAsset asset;
       asset.uuid = name;
       asset.path = std::string(device_paths::kDcim) + "/" + name;
       asset.incomplete = true;
-      if (asset.uuid == "100APPLE/IMG_0001.JPG") {
-        asset.files = {asset.path, std::string(device_paths::kDcim) + "/100APPLE/IMG_0001.MOV"};
+      if (asset.uuid == "100CAMRA/IMG_0001.JPG") {
+        asset.files = {asset.path, std::string(device_paths::kDcim) + "/100CAMRA/IMG_0001.MOV"};
       }
       ASSERT_TRUE(device->admin().addAsset(asset, nullptr));
     }
@@ -456,7 +456,7 @@ TEST_F(RestoreTest, AnAssetThatTheBackupDoesNotHoldFailsByName) {
     const auto device = open();
     NewDeviceAsset asset;
     asset.uuid = "LOST";
-    asset.path = std::string(device_paths::kDcim) + "/100APPLE/IMG_0099.JPG";
+    asset.path = std::string(device_paths::kDcim) + "/100CAMRA/IMG_0099.JPG";
     asset.incomplete = true;
     ASSERT_TRUE(device->admin().addAsset(asset, nullptr));
   }

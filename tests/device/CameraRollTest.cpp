@@ -16,7 +16,7 @@
 namespace kx {
 namespace {
 
-constexpr const char* kFolder = "/var/mobile/Media/DCIM/100APPLE/";
+constexpr const char* kFolder = "/var/mobile/Media/DCIM/100CAMRA/";
 // 2020-01-02 03:04:05 UTC, since 2001-01-01.
 constexpr double kTaken = 599627045.0;
 

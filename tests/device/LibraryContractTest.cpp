@@ -22,7 +22,7 @@ class SqliteContractDevice : public ContractDevice {
   void addAsset(const AssetSeed& seed) override {
     NewDeviceAsset asset;
     asset.uuid = seed.uuid.value_or("");
-    asset.path = seed.files.empty() ? std::string(device_paths::kDcim) + "/100APPLE/" + asset.uuid
+    asset.path = seed.files.empty() ? std::string(device_paths::kDcim) + "/100CAMRA/" + asset.uuid
                                     : seed.files.front();
     asset.savedAssetType = seed.savedAssetType;
     asset.isVideo = seed.isVideo;

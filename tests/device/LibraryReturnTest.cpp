@@ -11,7 +11,7 @@
 namespace kx {
 namespace {
 
-constexpr const char* kPhoto = "/var/mobile/Media/DCIM/100APPLE/IMG_0001.JPG";
+constexpr const char* kPhoto = "/var/mobile/Media/DCIM/100CAMRA/IMG_0001.JPG";
 
 // A library goes from one device to another.
 class LibraryReturnTest : public DeviceTest {
@@ -101,7 +101,7 @@ TEST_F(LibraryReturnTest, ADeviceWithPhotosOrAlbumsOfItsOwnKeepsItsLibrary) {
     if (photo) {
       NewDeviceAsset own;
       own.uuid = "NEWER";
-      own.path = "/var/mobile/Media/DCIM/100APPLE/IMG_0002.JPG";
+      own.path = "/var/mobile/Media/DCIM/100CAMRA/IMG_0002.JPG";
       putFile(own.path, kJpeg);
       ASSERT_TRUE(device().admin().addAsset(own, nullptr));
     } else {

@@ -173,10 +173,10 @@ TEST_F(QuarrydTest, FacesOfWrongTypeFailTheirAsset) {
 }
 
 TEST_F(QuarrydTest, TheDevicesOwnAssetIsNeverTouched) {
-  putFile("/var/mobile/Media/DCIM/100APPLE/IMG_0001.JPG", "own");
+  putFile("/var/mobile/Media/DCIM/100CAMRA/IMG_0001.JPG", "own");
   NewDeviceAsset own;
   own.uuid = kUUID1;
-  own.path = "/var/mobile/Media/DCIM/100APPLE/IMG_0001.JPG";
+  own.path = "/var/mobile/Media/DCIM/100CAMRA/IMG_0001.JPG";
   ASSERT_TRUE(device().admin().addAsset(own, nullptr));
   const KXSyncSaveJobPtr thief = importJob(kUUID2, kJpeg);
   thief->setOriginalAssetURL(own.path);
@@ -310,8 +310,8 @@ TEST_F(QuarrydTest, CleanUpRemovesWhatOlderSyncsLeft) {
 TEST_F(QuarrydTest, ARestoredAssetIsCompleteWhenAllItsFilesAreThere) {
   NewDeviceAsset asset;
   asset.uuid = "OWN";
-  asset.path = "/var/mobile/Media/DCIM/100APPLE/IMG_0001.JPG";
-  asset.files = {asset.path, "/var/mobile/Media/DCIM/100APPLE/IMG_0001.MOV"};
+  asset.path = "/var/mobile/Media/DCIM/100CAMRA/IMG_0001.JPG";
+  asset.files = {asset.path, "/var/mobile/Media/DCIM/100CAMRA/IMG_0001.MOV"};
   asset.incomplete = true;
   ASSERT_TRUE(device().admin().addAsset(asset, nullptr));
   KXPorterClient& porter = platform().porterClient();

@@ -7,7 +7,7 @@ namespace {
 
 using Texts = std::vector<std::string>;
 
-constexpr const char* kFolder = "/var/mobile/Media/DCIM/100APPLE/";
+constexpr const char* kFolder = "/var/mobile/Media/DCIM/100CAMRA/";
 
 // What the asset daemon does for a restore.
 class RestoreTest : public DeviceTest {

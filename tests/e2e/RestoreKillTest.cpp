@@ -33,7 +33,7 @@ std::string uuidOf(int number) {
 }
 
 std::string cameraPath(int number) {
-  return std::string(device_paths::kDcim) + "/" + std::to_string(100 + number % 3) + "APPLE/IMG_" +
+  return std::string(device_paths::kDcim) + "/" + std::to_string(100 + number % 3) + "CAMRA/IMG_" +
          std::to_string(1000 + number) + (number % 6 == 5 ? ".MOV" : ".JPG");
 }
 

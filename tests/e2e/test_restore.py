@@ -23,7 +23,7 @@ DATABASE = MEDIA + "/PhotoData/Photos.sqlite"
 
 
 def camera_name(number):
-    return f"{100 + number // 1000}APPLE/IMG_{number % 1000:04d}"
+    return f"{100 + number // 1000}CAMRA/IMG_{number % 1000:04d}"
 
 
 class Restores(EndToEnd):
@@ -247,8 +247,8 @@ class SmallDevices(Restores):
         self.take()
         shutil.rmtree(self.device)
         outside = self.path("outside.JPG")
-        for name in ("../../../../outside.JPG", "100APPLE/../../../../../outside.JPG",
-                     "/../outside.JPG", "100APPLE//x.JPG", "100APPLE/./x.JPG", "x\0.JPG"):
+        for name in ("../../../../outside.JPG", "100CAMRA/../../../../../outside.JPG",
+                     "/../outside.JPG", "100CAMRA//x.JPG", "100CAMRA/./x.JPG", "x\0.JPG"):
             with self.subTest(name=name):
                 def point(manifest, name=name):
                     manifest["files"] = manifest["files"][:1]
