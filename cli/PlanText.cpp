@@ -184,7 +184,7 @@ class Groups {
   }
 
   void addContainer(const Container& container) {
-    const auto members = [&container](std::size_t count) {
+    const auto members = [](std::size_t count) {
       return withDetail("", groupedNumber(count) + " in it");
     };
     if (container.fate == Fate::kNew) {
