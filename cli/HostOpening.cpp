@@ -1,10 +1,14 @@
 #include "cli/HostOpening.h"
 
+#include <sys/stat.h>
+
 #include <CLI/CLI.hpp>
 #include <cstdlib>
 #include <regex>
 
 #include "cli/Progress.h"
+#include "device/DeviceLayout.h"
+#include "host/HostFiles.h"
 
 namespace kx::cli {
 
@@ -63,6 +67,22 @@ HostOptions hostOptions(Context& context, const FolderReading& reading, const Ca
     return !cancel.isCancelled();
   };
   return options;
+}
+
+DataPtr previousSnapshotOf(const std::string& device) {
+  constexpr std::uint64_t kMostBytes = std::uint64_t{1} << 30;
+  FileHandle root;
+  if (openFolder(device, &root) != 0) return nullptr;
+  // That of the last sync that came to its end, else of the last one that was begun.
+  for (const std::string path : {device_paths::kLastSynced, device_paths::kSnapshot}) {
+    FileHandle file;
+    struct stat status = {};
+    std::vector<std::uint8_t> bytes;
+    if (openRegularBeneath(root.get(), path.substr(1), &file, &status) != 0) continue;
+    if (readWhole(file.get(), kMostBytes, &bytes) == 0)
+      return std::make_shared<Data>(std::move(bytes));
+  }
+  return nullptr;
 }
 
 void reportHostProblems(Context& context, const std::vector<HostProblem>& problems) {

@@ -29,6 +29,9 @@ int timezoneMinutes(const std::string& text);
 // The options for opening a host, with progress on the terminal and cancelling.
 HostOptions hostOptions(Context& context, const FolderReading& reading, const CancelToken& cancel);
 
+// The snapshot that the device at that path got last, null for none; for HostOptions.
+DataPtr previousSnapshotOf(const std::string& device);
+
 // Opens the host. Null and an error that names the path; UsageError when an option makes no sense.
 std::unique_ptr<HostLibrary> openHost(const std::string& path, const HostOptions& options,
                                       ErrorPtr* error);

@@ -98,7 +98,8 @@ int runPlan(Context& context, const SyncArguments& arguments) {
     context.console.finish();
   });
   ErrorPtr error;
-  const HostOptions options = hostOptions(context, arguments.reading, cancel);
+  HostOptions options = hostOptions(context, arguments.reading, cancel);
+  options.previousSnapshot = [&arguments] { return previousSnapshotOf(arguments.device); };
   const auto library = openHost(arguments.host, options, &error);
   if (!library) return reportPlan(context, arguments, planOfFailure(error, cancel), {});
 

@@ -125,7 +125,8 @@ int runSync(Context& context, const SyncArguments& arguments) {
   SyncReport report(context);
   SignalCancel signals(cancel, [&report](int signal) { report.endForced(signal); });
 
-  const HostOptions options = hostOptions(context, arguments.reading, cancel);
+  HostOptions options = hostOptions(context, arguments.reading, cancel);
+  options.previousSnapshot = [&arguments] { return previousSnapshotOf(arguments.device); };
   ErrorPtr error;
   const auto library = openHost(arguments.host, options, &error);
   if (!library) return report.end(hostFailure(error, cancel), {});

@@ -12,11 +12,13 @@
 #include <thread>
 #include <tuple>
 #include <unordered_map>
+#include <unordered_set>
 #include <utility>
 
 #include "host/FolderSnapshot.h"
 #include "host/HostFiles.h"
 #include "host/HostLimits.h"
+#include "host/PreviousSnapshot.h"
 #include "platform/foundation/PropertyList.h"
 
 namespace kx {
@@ -30,6 +32,7 @@ constexpr unsigned kMaxThreads = 64;
 struct Reading {
   std::optional<FolderAsset> asset;
   std::vector<std::string> problems;
+  std::string unread;  // why its bytes could not be had, "" when they could
 };
 
 // Reads the files of a listing on several threads.
@@ -108,7 +111,7 @@ class Reader {
       }
       MetadataRequest request{type, sideFile(file, &reading.problems),
                               options_.timezoneOffsetMinutes};
-      FolderAsset asset{file, type, readPhotoMetadata(source, request)};
+      FolderAsset asset{file, type, readPhotoMetadata(source, request), std::nullopt};
       reading.problems.insert(reading.problems.end(), asset.metadata.problems.begin(),
                               asset.metadata.problems.end());
       reading.asset = std::move(asset);
@@ -129,6 +132,7 @@ class Reader {
   // side file says.
   void keepUnread(const ScannedFile& file, const ContentType& type, const std::string& problem,
                   Reading* reading) const {
+    reading->unread = problem;
     if (!type.isMedia()) {
       reading->problems.push_back(problem);
       return;
@@ -139,7 +143,7 @@ class Reader {
     const MetadataRequest request{unread, sideFile(file, &reading->problems),
                                   options_.timezoneOffsetMinutes};
     const ByteSource nothing{std::span<const std::uint8_t>()};
-    FolderAsset asset{file, type, readPhotoMetadata(nothing, request)};
+    FolderAsset asset{file, type, readPhotoMetadata(nothing, request), std::nullopt};
     reading->problems.insert(reading->problems.end(), asset.metadata.problems.begin(),
                              asset.metadata.problems.end());
     reading->asset = std::move(asset);
@@ -239,6 +243,7 @@ class FolderLibrary final : public HostLibrary {
       setError(error, hostError(HostError::kCancelled, "cancelled"));
       return false;
     }
+    recallUnread(files, options, &reader.readings());
     for (std::size_t index = 0; index < files.size(); ++index) {
       Reading& reading = reader.readings()[index];
       for (std::string& text : reading.problems)
@@ -248,6 +253,26 @@ class FolderLibrary final : public HostLibrary {
     std::stable_sort(problems_.begin(), problems_.end(),
                      [](const HostProblem& a, const HostProblem& b) { return a.path < b.path; });
     return true;
+  }
+
+  // Files that could not be read, but were once, stay just as they were.
+  void recallUnread(const std::vector<ScannedFile>& files, const HostOptions& options,
+                    std::vector<Reading>* readings) const {
+    if (!options.previousSnapshot) return;
+    std::unordered_set<std::string> unread;
+    for (std::size_t index = 0; index < files.size(); ++index) {
+      if (!(*readings)[index].unread.empty()) unread.insert(identity_.asset(files[index].path));
+    }
+    if (unread.empty()) return;
+    const PreviousSnapshot previous(options.previousSnapshot(), identity_.library(), unread);
+    for (std::size_t index = 0; index < files.size(); ++index) {
+      Reading& reading = (*readings)[index];
+      if (reading.unread.empty()) continue;
+      auto asset = previous.asset(identity_.asset(files[index].path), files[index]);
+      if (!asset) continue;
+      reading.asset = std::move(asset);
+      reading.problems = {reading.unread + "; it stays in the library as it was"};
+    }
   }
 
   std::string emptyText() const {

@@ -21,7 +21,9 @@ namespace {
 constexpr int kFaceAlbumSubclass = 3;
 constexpr int kMasterAlbumSubclass = 5;
 
-double modificationSeconds(const ScannedFile& file) {
+double modificationSeconds(const FolderAsset& asset) {
+  if (asset.recorded) return asset.recorded->modified;
+  const ScannedFile& file = asset.file;
   // The later one, compared to the nanosecond before it becomes a real number.
   const FileTime time =
       file.sidePath.empty() ? file.modified : std::max(file.modified, file.sideModified);
@@ -67,10 +69,8 @@ class Builder {
     updates_->reserve(assets_.size() + 64);
     for (const FolderAsset& asset : assets_) {
       uuids_.push_back(Value::string(identity_.asset(asset.file.path)));
-      modified_.push_back(modificationSeconds(asset.file));
-      const std::optional<CaptureTime>& taken = asset.metadata.captureTime;
-      captured_.push_back(taken ? taken->hostSeconds(options_.timezoneOffsetMinutes)
-                                : modified_.back());
+      modified_.push_back(modificationSeconds(asset));
+      captured_.push_back(capturedSeconds(asset).value_or(modified_.back()));
       days_.push_back(dayOf(asset));
     }
     captureOrder_.resize(assets_.size());
@@ -80,7 +80,15 @@ class Builder {
                      [this](std::size_t a, std::size_t b) { return captured_[a] < captured_[b]; });
   }
 
+  std::optional<double> capturedSeconds(const FolderAsset& asset) const {
+    if (asset.recorded) return asset.recorded->captured;
+    const std::optional<CaptureTime>& taken = asset.metadata.captureTime;
+    if (!taken) return std::nullopt;
+    return taken->hostSeconds(options_.timezoneOffsetMinutes);
+  }
+
   std::string dayOf(const FolderAsset& asset) const {
+    if (asset.recorded) return asset.recorded->day;
     if (asset.metadata.captureTime) return asset.metadata.captureTime->isoDay();
     const ScannedFile& file = asset.file;
     const FileTime time =
@@ -169,7 +177,7 @@ class Builder {
     asset->setEventUUID(events_.at(days_[index]).stringValue());
     asset->setAdjustments(Value());
     // Without one, the reader of the record takes the modification date.
-    asset->setExposureDate(metadata.captureTime ? Value::real(captured_[index]) : Value());
+    asset->setExposureDate(capturedSeconds(from) ? Value::real(captured_[index]) : Value());
     asset->setModificationDate(Value::real(modified_[index]));
     if (metadata.place) {
       asset->setLatitude(Value::real(metadata.place->latitude));
@@ -199,7 +207,8 @@ class Builder {
     const KXSAssetPropertiesPtr properties = KXSAssetProperties::assetProperties();
     properties->setImageProperties(from.metadata.imageProperties);
     properties->setFileSystemProperties(
-        fileAttributesValue(from.file.sizeBytes, from.file.modified));
+        from.recorded ? from.recorded->fileProperties
+                      : fileAttributesValue(from.file.sizeBytes, from.file.modified));
     properties->setFileName(name);
     return properties;
   }

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -11,11 +12,20 @@
 
 namespace kx {
 
-// One photo or video of the folder, read.
+// Facts that an earlier snapshot states of a file that cannot be read now.
+struct RecordedFacts {
+  double modified = 0.0;           // host time
+  std::optional<double> captured;  // host time
+  std::string day;                 // its event's name
+  Value fileProperties;
+};
+
+// One photo or video of the folder, read. `recorded` counts instead of what file and metadata say.
 struct FolderAsset {
   ScannedFile file;
   ContentType type;
   PhotoMetadata metadata;
+  std::optional<RecordedFacts> recorded;
 };
 
 // Makes the snapshot's root dictionary of a folder's assets, which come sorted by path:

@@ -84,6 +84,9 @@ struct HostOptions {
   unsigned threads = 2;           // that read metadata; 0 counts as 1
   std::string userAgent;          // "kxsync/VERSION", the snapshot's "TesselUserAgent"
   HostProgressCallback progress;  // may be empty
+  // The folder's snapshot that a device got last, null for none. Asked for when files cannot be
+  // read: they stay as they were then. May be empty.
+  std::function<DataPtr()> previousSnapshot;
 };
 
 // A host library: a folder of photos and videos, read as a library of kind "Folder", or a host

@@ -16,8 +16,9 @@ class UnreadableFiles(EndToEnd):
         for number in (1, 2, 3):
             self.photo(f"Sea/{number}.jpg")
 
-    def photo(self, path):
-        self.write(os.path.join(self.host, path), jpeg(path.encode(), exif_of("2020:05:01 10:00:00")))
+    def photo(self, path, note=b""):
+        self.write(os.path.join(self.host, path),
+                   jpeg(path.encode() + note, exif_of(f"2020:05:01 10:00:0{path[-5]}")))
 
     def lock(self, path, mode=0):
         os.chmod(os.path.join(self.host, path), mode)
@@ -39,34 +40,62 @@ class UnreadableFiles(EndToEnd):
         return next(entry for entry in dump["assets"].values()
                     if entry["originalFileName"] == name)
 
-    def test_copy_stays_in_its_album_and_metadata_come_back(self):
+    def assert_stays_as_it_was(self, path, before):
+        result = self.sync()
+        self.assertEqual((result["requested"], result["deletedAssets"], result["updatedAssets"],
+                          result["failed"]), (0, 0, 0, []))
+        self.assertEqual(result["problems"], {
+            path: "it cannot be read: Permission denied; it stays in the library as it was"})
+        self.assertEqual(self.dump("--hash"), before)
+
+    def test_copy_on_the_device_stays_as_it_was(self):
         self.sync()
         before = self.dump("--hash")
         self.lock("Sea/2.jpg")
-        result = self.sync()
-        self.assertEqual(result["outcome"], "synced")
-        self.assertEqual((result["requested"], result["deletedAssets"], result["failed"]),
-                         (0, 0, []))
-        self.assertEqual(result["problems"], {
-            "Sea/2.jpg": "it cannot be read: Permission denied; it stays in the library, without "
-                         "its metadata"})
-        locked = self.dump("--hash")
-        self.assert_whole(locked)
-        self.assertEqual(self.entry_of(locked, "2.jpg")["sha256"],
-                         self.entry_of(before, "2.jpg")["sha256"])
-        self.assertEqual(sorted(self.file_names(locked, self.titles(locked["albums"])["Sea"])),
-                         ["1.jpg", "2.jpg", "3.jpg"])
+        self.assert_stays_as_it_was("Sea/2.jpg", before)
+        self.assert_stays_as_it_was("Sea/2.jpg", before)
         self.lock("Sea/2.jpg", 0o644)
         result = self.sync()
-        self.assertEqual((result["requested"], result["problems"]), (0, {}))
-        self.assertEqual(self.dump("--hash")["assets"], before["assets"])
+        self.assertEqual((result["requested"], result["updatedAssets"], result["problems"]),
+                         (0, 0, {}))
+        self.assertEqual(self.dump("--hash"), before)
+
+    def test_change_that_cannot_be_read_comes_when_it_can(self):
+        self.sync()
+        before = self.dump("--hash")
+        self.photo("Sea/2.jpg", note=b" edited")
+        os.utime(os.path.join(self.host, "Sea/2.jpg"), (1750000000, 1750000000))
+        self.lock("Sea/2.jpg")
+        self.assert_stays_as_it_was("Sea/2.jpg", before)
+        self.lock("Sea/2.jpg", 0o644)
+        result = self.sync()
+        self.assertEqual((result["requested"], result["imported"], result["problems"]), (1, 1, {}))
+        dump = self.dump("--hash")
+        self.assert_whole(dump)
+        self.assertNotEqual(self.entry_of(dump, "2.jpg")["sha256"],
+                            self.entry_of(before, "2.jpg")["sha256"])
+
+    def test_other_changes_are_made_beside_it(self):
+        self.sync()
+        before = self.dump("--hash")
+        self.lock("Sea/2.jpg")
+        self.photo("Sea/4.jpg")
+        os.remove(os.path.join(self.host, "Sea/1.jpg"))
+        result = self.sync()
+        self.assertEqual((result["imported"], result["deletedAssets"]), (1, 1))
+        dump = self.dump("--hash")
+        self.assertEqual(sorted(self.file_names(dump, self.titles(dump["albums"])["Sea"])),
+                         ["2.jpg", "3.jpg", "4.jpg"])
+        self.assertEqual(self.entry_of(dump, "2.jpg"), self.entry_of(before, "2.jpg"))
 
     def test_photo_that_was_never_readable_is_reported_and_comes_later(self):
         self.lock("Sea/2.jpg")
         result = self.sync(code=3)
         self.assertEqual(result["outcome"], "partial")
         self.assertEqual((result["imported"], len(result["failed"])), (2, 1))
-        self.assertIn("Sea/2.jpg", result["problems"])
+        self.assertEqual(result["problems"], {
+            "Sea/2.jpg": "it cannot be read: Permission denied; it stays in the library, without "
+                         "its metadata"})
         self.lock("Sea/2.jpg", 0o644)
         result = self.sync()
         self.assertEqual((result["outcome"], result["imported"]), ("synced", 1))

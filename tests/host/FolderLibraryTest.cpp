@@ -17,6 +17,7 @@
 #include "host/HostIdentity.h"
 #include "host/HostLibrary.h"
 #include "host/HostLimits.h"
+#include "platform/foundation/PropertyList.h"
 #include "tests/host/SamplePhotos.h"
 
 namespace kx {
@@ -461,6 +462,77 @@ TEST(FolderLibrary, WhatTheSideFileSaysOfAFileThatCannotBeReadCounts) {
   const Value asset = assetNamed(rootOf(*openHost(folder.path())), "a.jpg");
   EXPECT_EQ(asset["rating"].numberValue().int64Value(), 4);
   EXPECT_DOUBLE_EQ(real(asset["longitude"]), -7.5);
+}
+
+TEST(FolderLibrary, AFileThatCouldBeReadBeforeStaysJustAsItWas) {
+  const TemporaryFolder folder;
+  folder.write(
+      "Trip/a.jpg", withMetadata(photoTaken("2024:05:31 10:00:00"), [](Exiv2::Image& image) {
+        image.xmpData()["Xmp.dc.description"] = "At the lake";
+        image.xmpData()["Xmp.xmp.Rating"] = "-1";
+        image.xmpData()["Xmp.exif.GPSLatitude"] = "46,30N";
+        image.xmpData()["Xmp.exif.GPSLongitude"] = "7,30W";
+        addRegions(
+            {64, 48, {{"", "Face", 0.2, 0.2, 0.1, 0.1}, {"Ada", "Face", 0.8, 0.5, 0.2, 0.2}}},
+            &image.xmpData());
+      }));
+  folder.write("Trip/odd.name", jpeg());
+  folder.write("Trip/film.jpg", std::string("\0\0\0\x14", 4) + "ftypqt  " + std::string(8, '\0'));
+  folder.write("b.jpg", photoTaken("2024:05:30 10:00:00"));
+  const DataPtr before = openHost(folder.path())->snapshotBytes();
+  for (const char* name : {"Trip/a.jpg", "Trip/odd.name", "Trip/film.jpg"})
+    folder.setTime(name, 1'750'000'000, 0);
+  const AsOrdinaryUser user(folder);
+  for (const char* name : {"Trip/a.jpg", "Trip/odd.name", "Trip/film.jpg"})
+    ASSERT_EQ(::chmod(folder.at(name).c_str(), 0), 0);
+  HostOptions options;
+  options.previousSnapshot = [&] { return before; };
+  const auto library = openHost(folder.path(), options);
+  const Value rootBefore = readPropertyList(before, nullptr);
+  EXPECT_EQ(rootOf(*library), rootBefore);
+  EXPECT_EQ(rootOf(*library).description(), rootBefore.description());  // the order too
+  EXPECT_EQ(problemsOf(*library),
+            "Trip/a.jpg: it cannot be read: Permission denied; it stays in the library as it was\n"
+            "Trip/film.jpg: it cannot be read: Permission denied; it stays in the library as it "
+            "was\n"
+            "Trip/odd.name: it cannot be read: Permission denied; it stays in the library as it "
+            "was\n");
+}
+
+TEST(FolderLibrary, APreviousSnapshotThatIsOfNoUseIsAsGoodAsNone) {
+  const TemporaryFolder folder;
+  folder.write("a.jpg", photoTaken("2024:05:31 10:00:00"));
+  const DataPtr good = openHost(folder.path())->snapshotBytes();
+  HostOptions other;
+  other.libraryID = "2ED6657D-E927-568B-95E1-2665A8AEA6A2";
+  const DataPtr foreign = openHost(folder.path(), other)->snapshotBytes();
+  std::vector<DataPtr> useless{nullptr, std::make_shared<Data>(), foreign,
+                               std::make_shared<Data>(good->bytes(), good->length() - 1)};
+  const HostIdentity identity(HostIdentity::libraryOfFolder(folder.path()));
+  const auto made = [&](Value updates) {
+    ErrorPtr error;
+    useless.push_back(std::make_shared<Data>(writePropertyList(
+        Value::dictionary(Dictionary{{"libraryUUID", Value::string(identity.library())},
+                                     {"updates", std::move(updates)}}),
+        PropertyListFormat::kBinary, &error)));
+    EXPECT_EQ(error, nullptr);
+  };
+  made(Value::string("none"));
+  made(Value::array({Value::integer(1)}));
+  made(Value::array({Value::dictionary(
+      Dictionary{{"itemType", Value::string("Asset")}, {"uuid", Value::integer(1)}})}));
+  made(Value::array(
+      {Value::dictionary(Dictionary{{"itemType", Value::string("Asset")},
+                                    {"uuid", Value::string(identity.asset("a.jpg"))},
+                                    {"modificationDate", Value::string("yesterday")}})}));
+  const AsOrdinaryUser user(folder);
+  ASSERT_EQ(::chmod(folder.at("a.jpg").c_str(), 0), 0);
+  const DataPtr plain = openHost(folder.path())->snapshotBytes();
+  for (const DataPtr& previous : useless) {
+    HostOptions options;
+    options.previousSnapshot = [&] { return previous; };
+    EXPECT_TRUE(openHost(folder.path(), options)->snapshotBytes()->isEqual(*plain));
+  }
 }
 
 // Makes every positioned read of this thread fail, for good.
