@@ -35,7 +35,7 @@ ErrorPtr LibraryStore::write(const Work& work, const LibraryContext* origin) {
   ErrorPtr failure = broken_;
   if (parts_.readOnly) failure = systemError("cannot write", "the library", EROFS);
   if (!failure) {
-    LibraryWriter writer(database(), order_);
+    LibraryWriter writer(database(), order_, positions_);
     try {
       database().execute(parts_.planOnly ? "SAVEPOINT work" : "BEGIN IMMEDIATE");
       work(writer);
@@ -54,6 +54,7 @@ ErrorPtr LibraryStore::write(const Work& work, const LibraryContext* origin) {
     } catch (const std::exception& error) {
       failure = deviceError(DeviceError::kIo, error.what());
     }
+    positions_.clear();
     try {
       if (parts_.planOnly) {
         database().execute("ROLLBACK TO work; RELEASE work");

@@ -72,6 +72,7 @@ class LibraryStore {
 
   Parts parts_;
   AssetOrder order_;
+  KnownAlbumPositions positions_;
   std::string storeUUID_;
   RowId lastAlbum_ = 0;
   RowId lastFace_ = 0;

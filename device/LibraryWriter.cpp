@@ -1,7 +1,6 @@
 #include "device/LibraryWriter.h"
 
 #include <algorithm>
-#include <tuple>
 
 namespace kx {
 namespace {
@@ -28,27 +27,6 @@ void bindAsset(SqliteStatement& statement, const WholeAssetRow& row) {
 std::optional<double> seconds(const std::optional<Date>& date) {
   if (!date) return std::nullopt;
   return date->secondsSinceReference;
-}
-
-struct Member {
-  RowId asset = 0;
-  std::string uuid;
-  std::optional<double> sortToken;
-  std::optional<std::int64_t> stored;
-  std::optional<std::int64_t> wanted;
-};
-
-// The order inside an album: by position, those without one after the others by sort token (null
-// last), then by UUID.
-bool before(const Member& a, const Member& b, std::optional<std::int64_t> Member::*position) {
-  const auto key = [&](const Member& m) {
-    const bool placed = (m.*position).has_value();
-    return std::make_tuple(!placed, placed ? *(m.*position) : 0, !placed && !m.sortToken,
-                           placed ? 0.0 : m.sortToken.value_or(0.0));
-  };
-  const auto keyA = key(a);
-  const auto keyB = key(b);
-  return keyA != keyB ? keyA < keyB : a.uuid < b.uuid;
 }
 
 }  // namespace
@@ -90,7 +68,7 @@ void LibraryWriter::updateAlbum(RowId pk, const AlbumRow& old, const AlbumRow& a
       .integer(after.pendingCount)
       .integer(pk)
       .run();
-  if (old.uuid != after.uuid) orderStates_.erase(pk);
+  if (old.uuid != after.uuid) forgetPositions(pk);
   rows_.albums.insert(pk);
   if (after.uuid && old.title != after.title && isSyncedKind(after.kind)) {
     changes_.renamedContainers.insert(*after.uuid);
@@ -99,7 +77,7 @@ void LibraryWriter::updateAlbum(RowId pk, const AlbumRow& old, const AlbumRow& a
 
 void LibraryWriter::deleteAlbum(RowId pk, const AlbumRow& album) {
   SqliteStatement(database_, "DELETE FROM albums WHERE pk = ?").integer(pk).run();
-  orderStates_.erase(pk);
+  forgetPositions(pk);
   rows_.deletedAlbums.insert(pk);
   rows_.lists = true;
   if (album.uuid && isSyncedKind(album.kind)) changes_.deletedContainers.insert(*album.uuid);
@@ -152,8 +130,10 @@ void LibraryWriter::updateAsset(RowId pk, const DeviceAssetFields& fields) {
     rows_.assets.insert(pk);
   };
   using Statement = SqliteStatement;
-  if (fields.uuid)
+  if (fields.uuid) {
     set("UPDATE assets SET uuid = ? WHERE pk = ?", [&](Statement& s) { s.text(*fields.uuid); });
+    forgetPlaces(pk);
+  }
   if (fields.path)
     set("UPDATE assets SET path = ? WHERE pk = ?", [&](Statement& s) { s.text(*fields.path); });
   if (fields.savedAssetType)
@@ -238,106 +218,6 @@ void LibraryWriter::insertFace(RowId pk, RowId asset, const FaceRow& face) {
 void LibraryWriter::deleteFace(RowId pk, RowId asset) {
   SqliteStatement(database_, "DELETE FROM faces WHERE pk = ?").integer(pk).run();
   rows_.assets.insert(asset);
-}
-
-LibraryWriter::AlbumOrderState& LibraryWriter::orderState(RowId album) {
-  const auto [entry, isNew] = orderStates_.try_emplace(album);
-  if (isNew) {
-    SqliteStatement row(database_, "SELECT uuid, order_tag FROM albums WHERE pk = ?");
-    row.integer(album);
-    if (!row.step()) throw SqliteError(SQLITE_CONSTRAINT, "an album is gone");
-    entry->second.order = order_.album(row.optionalTextAt(0));
-    entry->second.current = row.optionalIntegerAt(1) == entry->second.order->tag();
-  }
-  return entry->second;
-}
-
-void LibraryWriter::addMembership(RowId album, RowId asset, std::string_view assetUUID) {
-  AlbumOrderState& state = orderState(album);
-  if (!state.current) {
-    renumber(album, *state.order);
-    state.current = true;
-  }
-  SqliteStatement(database_,
-                  "INSERT OR IGNORE INTO memberships(album, asset, position) "
-                  "VALUES(?, ?, ?)")
-      .integer(album)
-      .integer(asset)
-      .optionalInteger(state.order->indexOf(assetUUID))
-      .run();
-  rows_.assets.insert(asset);
-}
-
-void LibraryWriter::appendMembership(RowId album, RowId asset, std::int64_t position) {
-  SqliteStatement(database_,
-                  "INSERT INTO memberships(album, asset, position) VALUES(?, ?, ?) "
-                  "ON CONFLICT(album, asset) DO NOTHING")
-      .integer(album)
-      .integer(asset)
-      .integer(position)
-      .run();
-  rows_.assets.insert(asset);
-}
-
-void LibraryWriter::removeMembership(RowId album, RowId asset) {
-  SqliteStatement(database_, "DELETE FROM memberships WHERE album = ? AND asset = ?")
-      .integer(album)
-      .integer(asset)
-      .run();
-  rows_.assets.insert(asset);
-}
-
-namespace {
-
-std::vector<Member> membersOf(SqliteDatabase& database, RowId album,
-                              const AssetOrder::Album& order) {
-  std::vector<Member> members;
-  SqliteStatement row(database,
-                      "SELECT m.asset, a.uuid, a.sort_token, m.position FROM memberships m "
-                      "JOIN assets a ON a.pk = m.asset WHERE m.album = ?");
-  row.integer(album);
-  while (row.step()) {
-    Member member;
-    member.asset = row.integerAt(0);
-    member.uuid = row.textAt(1);
-    member.sortToken = row.optionalRealAt(2);
-    member.stored = row.optionalIntegerAt(3);
-    member.wanted = order.indexOf(member.uuid);
-    members.push_back(std::move(member));
-  }
-  return members;
-}
-
-}  // namespace
-
-void LibraryWriter::renumber(RowId album, const AssetOrder::Album& order) {
-  const std::vector<Member> members = membersOf(database_, album, order);
-  for (const Member& member : members) {
-    if (member.stored == member.wanted) continue;
-    SqliteStatement(database_, "UPDATE memberships SET position = ? WHERE album = ? AND asset = ?")
-        .optionalInteger(member.wanted)
-        .integer(album)
-        .integer(member.asset)
-        .run();
-  }
-  SqliteStatement(database_, "UPDATE albums SET order_tag = ? WHERE pk = ?")
-      .integer(order.tag())
-      .integer(album)
-      .run();
-}
-
-void LibraryWriter::sortAlbum(RowId album) {
-  AlbumOrderState& state = orderState(album);
-  if (state.current) return;
-  std::vector<Member> members = membersOf(database_, album, *state.order);
-  std::sort(members.begin(), members.end(),
-            [](const Member& a, const Member& b) { return before(a, b, &Member::stored); });
-  const bool inOrder = std::is_sorted(
-      members.begin(), members.end(),
-      [](const Member& a, const Member& b) { return before(a, b, &Member::wanted); });
-  if (inOrder) return;
-  renumber(album, *state.order);
-  state.current = true;
 }
 
 std::vector<RowId> LibraryWriter::listMembers(ListId list) {

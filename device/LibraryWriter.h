@@ -13,6 +13,7 @@
 #include "device/AssetOrder.h"
 #include "device/DeviceAdmin.h"
 #include "device/LibraryRows.h"
+#include "device/MemberPositions.h"
 #include "device/ReferenceDevice.h"
 #include "device/Sqlite.h"
 
@@ -33,7 +34,9 @@ class DeviceFailure : public std::runtime_error {
 // on the library's queue. Failures raise SqliteError or DeviceFailure.
 class LibraryWriter {
  public:
-  LibraryWriter(SqliteDatabase& database, AssetOrder& order) : database_(database), order_(order) {}
+  // `positions`: what earlier transactions learned; to be cleared when this one is rolled back.
+  LibraryWriter(SqliteDatabase& database, AssetOrder& order, KnownAlbumPositions& positions)
+      : database_(database), order_(order), knownPositions_(positions) {}
 
   void insertAlbum(RowId pk, const AlbumRow& album, std::optional<ListId> list);
   void updateAlbum(RowId pk, const AlbumRow& before, const AlbumRow& after);
@@ -75,14 +78,23 @@ class LibraryWriter {
  private:
   struct AlbumOrderState {
     std::shared_ptr<const AssetOrder::Album> order;
-    bool current = false;  // positions are those of `order`
+    bool tagged = false;                   // the row says that positions are those of `order`
+    MemberPositions* positions = nullptr;  // null: not read yet, or not those of `order`
   };
   AlbumOrderState& orderState(RowId album);
-  void renumber(RowId album, const AssetOrder::Album& order);
+  MemberPositions& learnPositions(RowId album, AlbumOrderState& state);
+  void putInOrder(RowId album, AlbumOrderState& state);
+  std::int64_t placeOf(RowId album, AlbumOrderState& state, std::int64_t index);
+  void writeMoves(RowId album, const std::vector<MemberPositions::Move>& moves);
+  void writeTag(RowId album, AlbumOrderState& state);
+  void forgetPositions(RowId album);
+  // The asset has another identifier: its albums' positions are not those of the order any more.
+  void forgetPlaces(RowId asset);
   std::vector<RowId> listMembers(ListId list);
 
   SqliteDatabase& database_;
   AssetOrder& order_;
+  KnownAlbumPositions& knownPositions_;
   std::map<RowId, AlbumOrderState> orderStates_;
   RowChanges rows_;
   LibraryChanges changes_;
