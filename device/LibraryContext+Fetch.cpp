@@ -102,12 +102,13 @@ void LibraryContext::prefetchFaces(const std::vector<KXManagedAssetPtr>& assets)
     StoredAsset& owner = static_cast<StoredAsset&>(*object);
     while (more && row.integerAt(0) < owner.pk_) more = row.step();
     if (owner.facesRead_ || owner.relationsChanged_) continue;
-    owner.faces_.clear();
+    std::vector<KXManagedFacePtr> found;
     for (; more && row.integerAt(0) == owner.pk_; more = row.step()) {
-      const std::shared_ptr<StoredFace> found = face(row.integerAt(1), owner.pk_);
-      if (!found->row_) found->load(readFaceRow(row, 2));
-      owner.faces_.push_back(found);
+      std::shared_ptr<StoredFace> shown = face(row.integerAt(1), owner.pk_);
+      if (!shown->loaded_) shown->load(readFaceRow(row, 2));
+      found.push_back(std::move(shown));
     }
+    owner.faces_ = std::move(found);
     owner.facesRead_ = true;
   }
 }
@@ -128,7 +129,7 @@ void LibraryContext::prefetchAlbums(const std::vector<KXManagedAssetPtr>& assets
     if (owner.relationsChanged_) continue;
     owner.albums_.clear();
     for (; more && row.integerAt(0) == owner.pk_; more = row.step()) {
-      const std::shared_ptr<StoredAlbum>& holder = albums_[row.integerAt(1)];
+      const std::shared_ptr<StoredAlbum>& holder = albums_.at(row.integerAt(1));
       if (!holder->isDeleted()) owner.albums_.push_back(holder);
     }
     owner.albumsRead_ = true;
@@ -311,17 +312,10 @@ std::shared_ptr<KXManagedAlbumList> LibraryContext::list(ListId id) {
 
 std::vector<std::shared_ptr<KXManagedObject>> LibraryContext::registeredObjects() {
   std::vector<std::shared_ptr<KXManagedObject>> objects;
-  objects.reserve(assets_.size() + faces_.size() + albums_.size());
-  const auto append = [&](const auto& registered) {
-    std::vector<RowId> rows;
-    rows.reserve(registered.size());
-    for (const auto& entry : registered) rows.push_back(entry.first);
-    std::sort(rows.begin(), rows.end());
-    for (const RowId pk : rows) objects.push_back(registered.at(pk));
-  };
-  append(assets_);
-  append(faces_);
-  append(albums_);
+  const auto append = [&](const auto& object) { objects.push_back(object); };
+  assets_.forEach(append);
+  faces_.forEach(append);
+  albums_.forEach(append);
   return objects;
 }
 
@@ -339,7 +333,7 @@ void LibraryContext::refreshObject(const std::shared_ptr<KXManagedObject>& objec
     }
     album->fault();
   } else if (const auto face = std::dynamic_pointer_cast<StoredFace>(object)) {
-    if (face->context_ == this && !face->inserted_) face->row_.reset();
+    if (face->context_ == this && !face->inserted_) face->fault();
   }
 }
 

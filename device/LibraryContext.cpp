@@ -15,14 +15,19 @@ LibraryContext::LibraryContext(std::shared_ptr<LibraryStore> store) : store_(std
 
 LibraryContext::~LibraryContext() {
   store_->close(this);
-  for (const auto& [pk, asset] : assets_) asset->context_ = nullptr;
-  for (const auto& [pk, face] : faces_) face->context_ = nullptr;
-  for (const auto& [pk, album] : albums_) album->context_ = nullptr;
+  // Each object is looked at once: most go at that.
+  const auto letGo = [](auto& object) {
+    object->context_ = nullptr;
+    object = nullptr;
+  };
+  assets_.forEach(letGo);
+  faces_.forEach(letGo);
+  albums_.forEach(letGo);
   for (const auto& list : lists_) list->context_ = nullptr;
 }
 
 std::shared_ptr<StoredAlbum> LibraryContext::album(RowId pk) {
-  std::shared_ptr<StoredAlbum>& entry = albums_[pk];
+  std::shared_ptr<StoredAlbum>& entry = albums_.at(pk);
   if (!entry) entry = std::make_shared<StoredAlbum>(this, pk);
   return entry;
 }
@@ -35,13 +40,13 @@ std::shared_ptr<StoredAlbum> LibraryContext::album(RowId pk, const SqliteStateme
 }
 
 std::shared_ptr<StoredAsset> LibraryContext::asset(RowId pk) {
-  std::shared_ptr<StoredAsset>& entry = assets_[pk];
+  std::shared_ptr<StoredAsset>& entry = assets_.at(pk);
   if (!entry) entry = std::make_shared<StoredAsset>(this, pk);
   return entry;
 }
 
 std::shared_ptr<StoredFace> LibraryContext::face(RowId pk, RowId asset) {
-  std::shared_ptr<StoredFace>& entry = faces_[pk];
+  std::shared_ptr<StoredFace>& entry = faces_.at(pk);
   if (!entry) entry = std::make_shared<StoredFace>(this, pk, asset);
   return entry;
 }
@@ -218,8 +223,7 @@ void LibraryContext::settle() {
     }
   }
   for (const auto& [key, face] : changedFaces_) {
-    const auto owner = assets_.find(face->asset_);
-    if (face->life_ == StoredFace::Life::kLive && owner != assets_.end()) {
+    if (face->life_ == StoredFace::Life::kLive && assets_.find(face->asset_)) {
       face->inserted_ = false;
       continue;
     }
@@ -257,9 +261,7 @@ void LibraryContext::dropChanges() {
     } else {
       face->life_ = StoredFace::Life::kLive;
     }
-    if (const auto owner = assets_.find(face->asset_); owner != assets_.end()) {
-      owner->second->forgetRelations();
-    }
+    if (const auto owner = assets_.find(face->asset_)) owner->forgetRelations();
   }
   ++albumsEpoch_;
   for (const auto& list : lists_) list->fault();
@@ -271,29 +273,29 @@ void LibraryContext::dropChanges() {
 
 void LibraryContext::refreshRows(const RowChanges& rows) {
   for (const RowId pk : rows.assets) {
-    const auto known = assets_.find(pk);
-    if (known == assets_.end()) continue;
-    for (const KXManagedFacePtr& face : known->second->faces_) {
+    const std::shared_ptr<StoredAsset> known = assets_.find(pk);
+    if (!known) continue;
+    for (const KXManagedFacePtr& face : known->faces_) {
       StoredFace& stored = static_cast<StoredFace&>(*face);
-      if (!stored.inserted_) stored.row_.reset();
+      if (!stored.inserted_) stored.fault();
     }
-    known->second->fault();
+    known->fault();
   }
   for (const RowId pk : rows.deletedAssets) {
-    const auto known = assets_.find(pk);
-    if (known == assets_.end()) continue;
+    const std::shared_ptr<StoredAsset> known = assets_.find(pk);
+    if (!known) continue;
     changedAssets_.erase(pk);
-    forget(*std::shared_ptr<StoredAsset>(known->second));
+    forget(*known);
   }
   for (const RowId pk : rows.albums) {
-    if (const auto known = albums_.find(pk); known != albums_.end()) known->second->fault();
+    if (const auto known = albums_.find(pk)) known->fault();
   }
   for (const RowId pk : rows.deletedAlbums) {
-    const auto known = albums_.find(pk);
-    if (known == albums_.end()) continue;
-    known->second->die();
+    const std::shared_ptr<StoredAlbum> known = albums_.find(pk);
+    if (!known) continue;
+    known->die();
     changedAlbums_.erase(pk);
-    albums_.erase(known);
+    albums_.erase(pk);
   }
   if (!rows.deletedAlbums.empty()) ++albumsEpoch_;
   if (rows.lists) {

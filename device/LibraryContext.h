@@ -6,11 +6,11 @@
 #include <optional>
 #include <string>
 #include <string_view>
-#include <unordered_map>
 #include <utility>
 #include <vector>
 
 #include "device/LibraryStore.h"
+#include "device/RowRegistry.h"
 #include "device/StoredAlbum.h"
 #include "device/StoredAlbumList.h"
 #include "device/StoredAsset.h"
@@ -98,9 +98,9 @@ class LibraryContext : public KXManagedObjectContext {
   void dropChangesOf(StoredAsset& asset);
 
   const std::shared_ptr<LibraryStore> store_;
-  std::unordered_map<RowId, std::shared_ptr<StoredAsset>> assets_;
-  std::unordered_map<RowId, std::shared_ptr<StoredFace>> faces_;
-  std::unordered_map<RowId, std::shared_ptr<StoredAlbum>> albums_;
+  RowRegistry<StoredAsset> assets_;
+  RowRegistry<StoredFace> faces_;
+  RowRegistry<StoredAlbum> albums_;
   std::map<RowId, std::shared_ptr<StoredAsset>> changedAssets_;  // deleted ones too
   std::map<RowId, std::shared_ptr<StoredAlbum>> changedAlbums_;  // inserted and deleted ones too
   // Inserted and deleted ones, by (asset, face).

@@ -25,7 +25,7 @@ std::vector<KXGenericAlbumPtr>::iterator placeOf(std::vector<KXGenericAlbumPtr>&
 
 const FaceRow& StoredFace::saved() const {
   if (life_ == Life::kGone || context_ == nullptr) return kGoneFace;
-  if (!row_) {
+  if (!loaded_) {
     SqliteStatement row(context_->store().database(),
                         "SELECT identifier, x, y, width, height, album_uuid FROM faces "
                         "WHERE pk = ?");
@@ -36,10 +36,18 @@ const FaceRow& StoredFace::saved() const {
     }
     load(readFaceRow(row, 0));
   }
-  return *row_;
+  return row_;
 }
 
-void StoredFace::load(FaceRow row) const { row_ = std::make_unique<FaceRow>(std::move(row)); }
+void StoredFace::load(FaceRow row) const {
+  row_ = std::move(row);
+  loaded_ = true;
+}
+
+void StoredFace::fault() {
+  loaded_ = false;
+  row_ = FaceRow();
+}
 
 ObjectID StoredFace::objectID() const {
   return context_ == nullptr ? ObjectID() : context_->store().objectID("Face", pk_);
@@ -59,7 +67,7 @@ std::string StoredFace::description() const {
 void StoredFace::die() {
   life_ = Life::kGone;
   inserted_ = false;
-  row_.reset();
+  fault();
 }
 
 const AssetRow& StoredAsset::saved() const {
@@ -183,7 +191,7 @@ std::span<const KXManagedFacePtr> StoredAsset::faces() {
     row.integer(pk_);
     while (row.step()) {
       const std::shared_ptr<StoredFace> face = context_->face(row.integerAt(0), pk_);
-      if (!face->row_) face->load(readFaceRow(row, 1));
+      if (!face->loaded_) face->load(readFaceRow(row, 1));
       faces_.push_back(face);
     }
     for (const auto& face : context_->insertedFaces(pk_)) faces_.push_back(face);

@@ -37,14 +37,16 @@ class StoredFace : public KXManagedFace, public std::enable_shared_from_this<Sto
 
   const FaceRow& saved() const;
   void load(FaceRow row) const;
+  void fault();
   void die();
 
   LibraryContext* context_;
   const RowId pk_;
   const RowId asset_;
-  mutable std::unique_ptr<FaceRow> row_;
   mutable Life life_ = Life::kLive;
+  mutable bool loaded_ = false;
   bool inserted_ = false;
+  mutable FaceRow row_;
 };
 
 // An asset of one context; the rules of StoredAlbum hold.
