@@ -1,40 +1,13 @@
 #include <cerrno>
-#include <unordered_map>
 
 #include "device/DeviceErrors.h"
 #include "device/DeviceLayout.h"
 #include "device/QuarrydJobs.h"
-#include "platform/foundation/Exceptions.h"
+#include "device/SnapshotAssets.h"
 #include "platform/foundation/PropertyList.h"
 
 namespace kx {
 namespace {
-
-// Host dates count from 1904-01-01, ours from 2001-01-01.
-constexpr double kHostDateOffset = 3061152000.0;
-
-// By identifier; the texts are those of the property list that they come from.
-using ModificationDates = std::unordered_map<std::string_view, double>;
-
-// What the snapshot says of each asset; null, and why, when it makes no sense.
-std::optional<ModificationDates> assetsOfSnapshot(const Value& root, std::string* why) {
-  try {
-    ModificationDates dates;
-    const std::optional<ArrayView> updates = root["updates"].asArray("updates");
-    for (std::size_t i = 0; updates && i < updates->size(); ++i) {
-      const Value item = (*updates)[i];
-      if (item["itemType"].asString("itemType") != OptionalString("Asset")) continue;
-      const OptionalString uuid = item["uuid"].asString("uuid");
-      if (!uuid) continue;
-      const auto modified = item["modificationDate"].asNumber("modificationDate");
-      dates[*uuid] = (modified ? modified->doubleValue() : 0.0) - kHostDateOffset;
-    }
-    return dates;
-  } catch (const TypeError& problem) {
-    *why = problem.what();
-    return std::nullopt;
-  }
-}
 
 bool isOlder(const struct stat& status, const std::optional<Date>& date) {
   constexpr double kReferenceDateSinceUnixEpoch = 978307200.0;
@@ -90,28 +63,30 @@ std::optional<std::string> Quarryd::whyNotWhole(const DataPtr& snapshot) {
     return unreadable ? unreadable->description() : "the snapshot is no dictionary";
   }
   std::string why;
-  std::optional<ModificationDates> wanted = assetsOfSnapshot(root, &why);
+  std::optional<SnapshotAssets> wanted = SnapshotAssets::of(root, &why);
   if (!wanted) return why;
   std::optional<std::string> found;
   store.queue().sync([&] {
     try {
       SqliteStatement row(store.database(),
                           "SELECT uuid, modification_date, incomplete FROM assets "
-                          "WHERE saved_type = 256");
+                          "WHERE +saved_type = 256");
       while (row.step()) {
-        const auto expected = wanted->find(row.textViewAt(0));
-        if (expected == wanted->end()) continue;
+        SnapshotAssets::Asset* const expected = wanted->find(row.textViewAt(0));
+        if (expected == nullptr) continue;
         if (row.integerAt(2) != 0) {
-          found = std::string(expected->first) + " is incomplete";
+          found = std::string(expected->uuid) + " is incomplete";
           return;
         }
-        if (row.optionalRealAt(1) != std::optional<double>(expected->second)) {
-          found = std::string(expected->first) + " has another modification date";
+        if (row.optionalRealAt(1) != std::optional<double>(expected->modified)) {
+          found = std::string(expected->uuid) + " has another modification date";
           return;
         }
-        wanted->erase(expected);
+        expected->proved = true;
       }
-      if (!wanted->empty()) found = std::string(wanted->begin()->first) + " is not in the library";
+      if (const SnapshotAssets::Asset* missing = wanted->firstNotProved()) {
+        found = std::string(missing->uuid) + " is not in the library";
+      }
     } catch (const SqliteError& error) {
       found = error.what();
     }

@@ -53,6 +53,43 @@ TEST_F(SealTest, IsWithheldForAnotherModificationDate) {
   EXPECT_NE(reason().find("another modification date"), std::string::npos) << reason();
 }
 
+// Assets whose fields do not stand as those of the item before.
+TEST_F(SealTest, ReadsItemsOfAnyShape) {
+  const auto item = [](const std::string& uuid, double modified) {
+    return Dictionary{{"itemType", Value::string("Asset")},
+                      {"modificationDate", Value::real(3061152000.0 + modified)},
+                      {"uuid", Value::string(uuid)}};
+  };
+  const auto put = [&](Array updates) {
+    const Value root = Value::dictionary({{"updates", Value::array(std::move(updates))}});
+    const auto bytes = writePropertyList(root, PropertyListFormat::kBinary, nullptr);
+    ASSERT_TRUE(platform().files().writeFileAtomically(device_paths::kSnapshot, bytes, nullptr));
+  };
+  save({importJob(kUUID1, kJpeg), importJob(kUUID2, kJpeg)});
+  Dictionary album{{"uuid", Value::string(kUUID3)}, {"itemType", Value::string("Album")}};
+  Dictionary nameless{{"itemType", Value::string("Asset")}};
+  Dictionary dateless{{"uuid", Value::string(kUUID2)}, {"itemType", Value::string("Asset")}};
+  const Value first = Value::dictionary(item(kUUID1, 100));
+  const Value second = Value::dictionary(item(kUUID2, 100));
+  put({first, Value::dictionary(album), second, Value::dictionary(dateless)});
+  save({sealJob()});
+  EXPECT_NE(reason().find(kUUID2 + " has another modification date"), std::string::npos);
+  put({first, second, Value::dictionary(item(kUUID1, 7))});
+  save({sealJob()});
+  EXPECT_NE(reason().find(kUUID1 + " has another modification date"), std::string::npos);
+  EXPECT_FALSE(sealed());
+  Dictionary wrong = item(kUUID2, 100);
+  wrong.set("uuid", Value::integer(1));
+  put({first, Value::dictionary(wrong)});
+  save({sealJob()});
+  EXPECT_FALSE(sealed());
+  // The last of several with one identifier counts.
+  put({Value::dictionary(item(kUUID1, 7)), Value::dictionary(dateless), first, second,
+       Value::dictionary(nameless), Value::dictionary(album)});
+  save({sealJob()});
+  EXPECT_TRUE(sealed()) << reason();
+}
+
 TEST_F(SealTest, IsWithheldForAnIncompleteAsset) {
   putSnapshot({kUUID1});
   save({importJob(kUUID1, kJpeg)});
