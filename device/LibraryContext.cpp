@@ -134,9 +134,16 @@ ErrorPtr LibraryContext::save() {
   return failure;
 }
 
+OptionalString LibraryContext::nameAtHand(RowId pk) const {
+  const std::shared_ptr<StoredAsset> known = assets_.find(pk);
+  if (!known || !known->loaded_ || known->isDeleted()) return std::nullopt;
+  return known->uuid();
+}
+
 void LibraryContext::flush(LibraryWriter& writer) {
   flushAlbums(writer);
   flushAssets(writer);
+  writer.setNames([this](RowId pk) { return nameAtHand(pk); });
   flushMemberships(writer);
   for (const auto& [pk, album] : changedAlbums_) {
     if (album->life_ == StoredAlbum::Life::kDeleting && !album->insertedInto_) {

@@ -88,6 +88,8 @@ class LibraryContext : public KXManagedObjectContext {
   void prefetchAlbums(const std::vector<KXManagedAssetPtr>& assets);
   bool isEmptyNow(RowId album);
   void flush(LibraryWriter& writer);
+  // The identifier of an asset as a flush has written it, if it is at hand.
+  OptionalString nameAtHand(RowId pk) const;
   void flushAlbums(LibraryWriter& writer);
   void flushAssets(LibraryWriter& writer);
   void flushMemberships(LibraryWriter& writer);

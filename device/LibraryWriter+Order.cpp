@@ -8,18 +8,19 @@ namespace {
 
 using Member = MemberPositions::Member;
 
-std::vector<Member> membersOf(SqliteDatabase& database, RowId album,
-                              const AssetOrder::Album& order) {
-  std::vector<Member> members;
-  SqliteStatement row(database,
-                      "SELECT m.asset, m.position, a.uuid FROM memberships m "
-                      "JOIN assets a ON a.pk = m.asset WHERE m.album = ?");
-  row.integer(album);
-  while (row.step()) {
-    members.push_back(
-        {row.integerAt(0), order.indexOf(row.textViewAt(2)), row.optionalIntegerAt(1)});
-  }
-  return members;
+// Whether positions and indexes alone say how the members stand, and would stand.
+bool sayTheOrder(const std::vector<Member>& members) {
+  const auto differ = [&](std::optional<std::int64_t> Member::*number) {
+    std::vector<std::int64_t> numbers;
+    numbers.reserve(members.size());
+    for (const Member& member : members) {
+      if (!(member.*number)) return false;
+      numbers.push_back(*(member.*number));
+    }
+    std::sort(numbers.begin(), numbers.end());
+    return std::adjacent_find(numbers.begin(), numbers.end()) == numbers.end();
+  };
+  return differ(&Member::stored) && differ(&Member::index);
 }
 
 // A member with all that the order inside an album depends on.
@@ -85,6 +86,24 @@ LibraryWriter::AlbumOrderState& LibraryWriter::orderState(RowId album) {
   return state;
 }
 
+std::vector<Member> LibraryWriter::membersOf(RowId album, const AssetOrder::Album& order) {
+  std::vector<Member> members;
+  SqliteStatement row(database_, "SELECT asset, position FROM memberships WHERE album = ?");
+  row.integer(album);
+  while (row.step()) {
+    Member member{row.integerAt(0), std::nullopt, row.optionalIntegerAt(1)};
+    if (const OptionalString name = names_ ? names_(member.asset) : std::nullopt) {
+      member.index = order.indexOf(*name);
+    } else {
+      SqliteStatement asset(database_, "SELECT uuid FROM assets WHERE pk = ?");
+      asset.integer(member.asset);
+      if (asset.step()) member.index = order.indexOf(asset.textViewAt(0));
+    }
+    members.push_back(member);
+  }
+  return members;
+}
+
 MemberPositions& LibraryWriter::learnPositions(RowId album, AlbumOrderState& state) {
   KnownPositions& known = knownPositions_[album];
   known.order = state.order;
@@ -113,7 +132,7 @@ void LibraryWriter::writeTag(RowId album, AlbumOrderState& state) {
 
 void LibraryWriter::putInOrder(RowId album, AlbumOrderState& state) {
   if (state.positions == nullptr) {
-    std::vector<Member> members = membersOf(database_, album, *state.order);
+    std::vector<Member> members = membersOf(album, *state.order);
     writeMoves(album, learnPositions(album, state).adopt(std::move(members)));
   }
   writeTag(album, state);
@@ -121,7 +140,7 @@ void LibraryWriter::putInOrder(RowId album, AlbumOrderState& state) {
 
 std::int64_t LibraryWriter::placeOf(RowId album, AlbumOrderState& state, std::int64_t index) {
   if (const std::optional<std::int64_t> place = state.positions->place(index)) return *place;
-  const std::vector<Member> members = membersOf(database_, album, *state.order);
+  const std::vector<Member> members = membersOf(album, *state.order);
   writeMoves(album, state.positions->numberAnew(members, index));
   return *state.positions->place(index);
 }
@@ -182,11 +201,11 @@ void LibraryWriter::removeMembership(RowId album, RowId asset) {
 void LibraryWriter::sortAlbum(RowId album) {
   AlbumOrderState& state = orderState(album);
   if (state.tagged || state.positions != nullptr) return;
+  const std::vector<Member> members = membersOf(album, *state.order);
   MemberPositions positions;
-  const std::vector<MemberPositions::Move> moves =
-      positions.adopt(membersOf(database_, album, *state.order));
+  const std::vector<MemberPositions::Move> moves = positions.adopt(members);
   if (!moves.empty()) {
-    if (isInOrder(database_, album, *state.order)) return;
+    if (!sayTheOrder(members) && isInOrder(database_, album, *state.order)) return;
     writeMoves(album, moves);
     writeTag(album, state);
   }

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <memory>
 #include <optional>
@@ -37,6 +38,10 @@ class LibraryWriter {
   // `positions`: what earlier transactions learned; to be cleared when this one is rolled back.
   LibraryWriter(SqliteDatabase& database, AssetOrder& order, KnownAlbumPositions& positions)
       : database_(database), order_(order), knownPositions_(positions) {}
+
+  // Spares a look into the table for each asset whose identifier is at hand.
+  using Names = std::function<OptionalString(RowId asset)>;
+  void setNames(Names names) { names_ = std::move(names); }
 
   void insertAlbum(RowId pk, const AlbumRow& album, std::optional<ListId> list);
   void updateAlbum(RowId pk, const AlbumRow& before, const AlbumRow& after);
@@ -82,6 +87,7 @@ class LibraryWriter {
     MemberPositions* positions = nullptr;  // null: not read yet, or not those of `order`
   };
   AlbumOrderState& orderState(RowId album);
+  std::vector<MemberPositions::Member> membersOf(RowId album, const AssetOrder::Album& order);
   MemberPositions& learnPositions(RowId album, AlbumOrderState& state);
   void putInOrder(RowId album, AlbumOrderState& state);
   std::int64_t placeOf(RowId album, AlbumOrderState& state, std::int64_t index);
@@ -99,6 +105,7 @@ class LibraryWriter {
   RowChanges rows_;
   LibraryChanges changes_;
   std::vector<std::string> releasedFiles_;
+  Names names_;
 };
 
 }  // namespace kx
