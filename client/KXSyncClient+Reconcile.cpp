@@ -111,12 +111,13 @@ void KXSyncClient::removeSyncUserAgentInfoFile(const std::string& path) {
 bool KXSyncClient::equalsPreviousSnapshot(const KXSLibraryChangeSnapshot& snapshot,
                                           const DataPtr& bytes,
                                           std::optional<std::string>* libraryUUID) {
-  const DataPtr last = platform_.files().readFile(KXPreviousMetadataSyncFilePath, nullptr);
-  if (!last) return false;
-  if (bytes && bytes->isEqualToData(*last)) {
+  FileSystem& files = platform_.files();
+  if (bytes && files.fileHolds(KXPreviousMetadataSyncFilePath, bytes->span())) {
     *libraryUUID = snapshot.libraryUUID();
     return snapshot.isEqualToTwin();
   }
+  const DataPtr last = files.readFile(KXPreviousMetadataSyncFilePath, nullptr);
+  if (!last) return false;
   const Value root = readPropertyList(last, nullptr);
   if (!root.isDictionary()) return false;
   try {

@@ -106,12 +106,9 @@ ErrorPtr SyncSession::checkAgainstDevice() {
 
 // Whether the host's snapshot is, byte for byte, the one that the device sealed last.
 bool SyncSession::matchesSeal() {
-  if (matchesSeal_) return *matchesSeal_;
-  ErrorPtr ignored;
-  const DataPtr last = files_.fileExists(KXPreviousMetadataSyncFilePath)
-                           ? files_.readFile(KXPreviousMetadataSyncFilePath, &ignored)
-                           : nullptr;
-  matchesSeal_ = last && last->isEqualToData(*snapshot_.bytes);
+  if (!matchesSeal_) {
+    matchesSeal_ = files_.fileHolds(KXPreviousMetadataSyncFilePath, snapshot_.bytes->span());
+  }
   return *matchesSeal_;
 }
 

@@ -83,6 +83,10 @@ DataPtr DeviceFileSystem::readFile(const std::string& path, ErrorPtr* error) {
   return std::make_shared<const Data>(std::move(bytes));
 }
 
+bool DeviceFileSystem::fileHolds(const std::string& path, std::span<const std::uint8_t> bytes) {
+  return root_->fileHolds(path, bytes);
+}
+
 bool DeviceFileSystem::writeFileAtomically(const std::string& path,
                                            std::span<const std::uint8_t> bytes, ErrorPtr* error) {
   return done(path, readOnly_ ? EROFS : root_->writeAtomically(path, bytes), error);

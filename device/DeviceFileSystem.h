@@ -18,6 +18,7 @@ class DeviceFileSystem : public FileSystem {
 
   bool fileExists(const std::string& path) override;
   DataPtr readFile(const std::string& path, ErrorPtr* error) override;
+  bool fileHolds(const std::string& path, std::span<const std::uint8_t> bytes) override;
   bool writeFileAtomically(const std::string& path, std::span<const std::uint8_t> bytes,
                            ErrorPtr* error) override;
   bool removeItem(const std::string& path, ErrorPtr* error) override;

@@ -28,7 +28,7 @@ constexpr mode_t kDirectoryMode = 0700;
 constexpr mode_t kFileMode = 0600;
 constexpr std::string_view kTemporaryPrefix = ".kxtmp-";
 constexpr std::size_t kTemporaryDigits = 16;
-constexpr std::size_t kCompareBytes = std::size_t{128} << 10;
+constexpr std::size_t kPieceBytes = std::size_t{128} << 10;
 
 std::atomic<bool> kernelLacksOpenat2{false};
 
@@ -94,9 +94,12 @@ int readAll(int fd, std::vector<std::uint8_t>* out) {
   if (::fstat(fd, &status) != 0) return errno;
   if (S_ISDIR(status.st_mode)) return EISDIR;
   if (!S_ISREG(status.st_mode)) return EINVAL;
-  out->resize(static_cast<std::size_t>(status.st_size));
+  const auto size = static_cast<std::size_t>(status.st_size);
+  out->reserve(size);
   std::size_t done = 0;
-  for (std::size_t count = 1; done < out->size() && count > 0; done += count) {
+  for (std::size_t count = 1; done < size && count > 0; done += count) {
+    // The vector clears what it grows by, which costs little while that is in the cache.
+    out->resize(std::min(size, done + kPieceBytes));
     if (const int failed = readSome(fd, std::span(*out).subspan(done), &count); failed != 0) {
       return failed;
     }
@@ -113,7 +116,7 @@ int readAll(int fd, std::vector<std::uint8_t>* out) {
 
 // Whether the file holds just these bytes. A file that cannot be read does not.
 bool holds(int fd, std::span<const std::uint8_t> bytes) {
-  std::vector<std::uint8_t> buffer(kCompareBytes);
+  std::vector<std::uint8_t> buffer(kPieceBytes);
   for (std::size_t count = 1; count > 0; bytes = bytes.subspan(count)) {
     if (readSome(fd, buffer, &count) != 0 || count > bytes.size() ||
         !std::equal(buffer.begin(), buffer.begin() + static_cast<std::ptrdiff_t>(count),
@@ -253,6 +256,14 @@ int DeviceRoot::readFile(const std::string& path, std::vector<std::uint8_t>* out
   return readAll(fd.get(), out);
 }
 
+bool DeviceRoot::fileHolds(const std::string& path, std::span<const std::uint8_t> bytes) const {
+  struct stat present;
+  UniqueFd fd;
+  return status(path, &present) == 0 && S_ISREG(present.st_mode) &&
+         static_cast<std::size_t>(present.st_size) == bytes.size() &&
+         resolve(path, O_RDONLY | O_NONBLOCK, 0, &fd) == 0 && holds(fd.get(), bytes);
+}
+
 int DeviceRoot::makeDirectories(const std::string& path) const {
   if (const int bad = checkPath(path); bad != 0) return bad;
   for (std::size_t slash = path.find('/', 1); path != "/"; slash = path.find('/', slash + 1)) {
@@ -276,12 +287,7 @@ int DeviceRoot::writeAtomically(const std::string& path,
   UniqueFd parent;
   std::string leaf;
   if (const int bad = openParent(path, &parent, &leaf); bad != 0) return bad;
-  struct stat present;
-  if (status(path, &present) == 0 && S_ISREG(present.st_mode) &&
-      static_cast<std::size_t>(present.st_size) == bytes.size()) {
-    UniqueFd old;
-    if (resolve(path, O_RDONLY | O_NONBLOCK, 0, &old) == 0 && holds(old.get(), bytes)) return 0;
-  }
+  if (fileHolds(path, bytes)) return 0;
   const std::string temporary = temporaryName();
   UniqueFd file(::openat(parent.get(), temporary.c_str(),
                          O_CREAT | O_EXCL | O_WRONLY | O_CLOEXEC | O_NOFOLLOW, kFileMode));

@@ -55,6 +55,8 @@ class DeviceRoot {
   [[nodiscard]] int openFile(const std::string& path, int flags, UniqueFd* out) const;
   [[nodiscard]] int status(const std::string& path, struct stat* out) const;  // of a link itself
   [[nodiscard]] int readFile(const std::string& path, std::vector<std::uint8_t>* out) const;
+  // Whether a regular file is there that can be read and holds just these bytes.
+  bool fileHolds(const std::string& path, std::span<const std::uint8_t> bytes) const;
   // Makes missing directories and syncs what they lie in.
   [[nodiscard]] int makeDirectories(const std::string& path) const;
   // The one way to replace a state file: temporary file in the same directory, fsync, rename, fsync

@@ -146,6 +146,17 @@ DataPtr OverlayFileSystem::readFile(const std::string& path, ErrorPtr* error) {
   return below_.readFile(path, error);
 }
 
+bool OverlayFileSystem::fileHolds(const std::string& path, std::span<const std::uint8_t> bytes) {
+  {
+    const std::lock_guard<std::mutex> lock(mutex_);
+    if (blocked(path) != 0) return false;
+    if (const Entry* entry = find(path)) {
+      return entry->kind == Kind::kFile && std::ranges::equal(entry->bytes->span(), bytes);
+    }
+  }
+  return below_.fileHolds(path, bytes);
+}
+
 bool OverlayFileSystem::writeFileAtomically(const std::string& path,
                                             std::span<const std::uint8_t> bytes, ErrorPtr* error) {
   int failed = DeviceRoot::checkPath(path);

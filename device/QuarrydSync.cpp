@@ -103,8 +103,7 @@ ErrorPtr Quarryd::seal(const std::string& snapshotPath) {
                         systemError("cannot read", snapshotPath, errnoOf(false, error)));
     return nullptr;
   }
-  const DataPtr sealed = files_.readFile(device_paths::kLastSynced, nullptr);
-  if (sealed && sealed->isEqualToData(*snapshot)) {
+  if (files_.fileHolds(device_paths::kLastSynced, snapshot->span())) {
     return nullptr;  // proved before, and nothing has been taken back since
   }
   if (const std::optional<std::string> why = whyNotWhole(snapshot)) {

@@ -16,6 +16,7 @@ namespace kx {
 
 namespace {
 
+constexpr std::size_t kReadBytes = std::size_t{128} << 10;
 constexpr int kSafeFlags = O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC;
 
 // A handle on a path alone is never waited for, and openat2 refuses to be told so.
@@ -134,9 +135,13 @@ int readWhole(int file, std::uint64_t limitBytes, std::vector<std::uint8_t>* byt
   struct stat status = {};
   if (::fstat(file, &status) != 0) return errno;
   if (static_cast<std::uint64_t>(status.st_size) > limitBytes) return EFBIG;
-  bytes->resize(static_cast<std::size_t>(status.st_size));
+  const auto size = static_cast<std::size_t>(status.st_size);
+  bytes->clear();
+  bytes->reserve(size);
   std::size_t done = 0;
-  while (done < bytes->size()) {
+  while (done < size) {
+    // The vector clears what it grows by, which costs little while that is in the cache.
+    bytes->resize(std::min(size, done + kReadBytes));
     const ssize_t got =
         ::pread(file, bytes->data() + done, bytes->size() - done, static_cast<off_t>(done));
     if (got < 0 && errno == EINTR) continue;

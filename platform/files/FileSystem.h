@@ -1,5 +1,6 @@
 #pragma once
 
+#include <algorithm>
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -42,6 +43,12 @@ class FileSystem {
   virtual bool fileExists(const std::string& path) = 0;
   // Whole content; null and an error when it cannot be read.
   virtual DataPtr readFile(const std::string& path, ErrorPtr* error) = 0;
+  // Whether the file can be read and holds exactly these bytes. An implementation may do with less
+  // than the whole file in memory.
+  virtual bool fileHolds(const std::string& path, std::span<const std::uint8_t> bytes) {
+    const DataPtr held = readFile(path, nullptr);
+    return held && std::ranges::equal(held->span(), bytes);
+  }
   // Replaces the file whole: temporary file in the same directory, synced, renamed, directory
   // synced. A file that already holds exactly these bytes is left as it is.
   virtual bool writeFileAtomically(const std::string& path, std::span<const std::uint8_t> bytes,

@@ -100,6 +100,29 @@ class FileSystemContract : public ::testing::TestWithParam<ContractFilesMaker> {
   std::unique_ptr<ContractFiles> made_;
 };
 
+TEST_P(FileSystemContract, HoldsExactlyTheBytesThatAreThere) {
+  const auto holds = [this](const std::string& path, const std::string& text) {
+    const auto* bytes = reinterpret_cast<const std::uint8_t*>(text.data());
+    return files().fileHolds(path, {bytes, text.size()});
+  };
+  EXPECT_TRUE(holds("/d/old", "old text"));
+  EXPECT_FALSE(holds("/d/old", "old tex"));
+  EXPECT_FALSE(holds("/d/old", "old text "));
+  EXPECT_FALSE(holds("/d/old", "old texT"));
+  EXPECT_FALSE(holds("/d/none", ""));
+  EXPECT_FALSE(holds("/d/sub", ""));
+  EXPECT_FALSE(holds("/link/old", "old text"));
+  std::string large(1000003, 'x');
+  EXPECT_EQ(write("/d/large", large), 0);
+  EXPECT_TRUE(holds("/d/large", large));
+  large.back() = 'y';
+  EXPECT_FALSE(holds("/d/large", large));
+  EXPECT_EQ(write("/d/old", ""), 0);
+  EXPECT_TRUE(holds("/d/old", ""));
+  EXPECT_EQ(remove("/d/old"), 0);
+  EXPECT_FALSE(holds("/d/old", ""));
+}
+
 TEST_P(FileSystemContract, ReadsWhatIsThere) {
   EXPECT_EQ(read("/d/old"), "old text");
   EXPECT_EQ(read("/d/none"), "error " + std::to_string(ENOENT));
