@@ -9,6 +9,7 @@
 #include <iterator>
 #include <string>
 
+#include "daemon/ProcessMemory.h"
 #include "platform/foundation/PropertyList.h"
 #include "transport/KXSTransportDecoder.h"
 
@@ -23,9 +24,7 @@ class Sum {
   void add(bool flag) { total_ += flag ? 1 : 0; }
   void add(const std::optional<ArrayView>& list) {
     if (!list) return;
-    for (const Value& element : *list) {
-      total_ += element.isString() ? static_cast<double>(element.stringValue().size()) : 1;
-    }
+    for (std::size_t i = 0; i < list->size(); ++i) add(list->stringAt(i, "element"));
   }
   void addFaces(const KXSAsset& asset) {
     for (const KXSFacePtr& face : asset.getFacesArray()) {
@@ -128,5 +127,6 @@ int main(int count, char** arguments) {
     std::fprintf(stderr, "usage: decode-snapshot FILE\n");
     return 2;
   }
+  kx::keepFreedMemory();  // as the programs do
   return kx::run(arguments[1]);
 }

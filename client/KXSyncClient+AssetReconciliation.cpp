@@ -114,8 +114,8 @@ void KXSyncClient::computeSortTokens() {
   sortTokens_->reserve(uuids->size());
   double previous = kNoPreviousTime;
   unsigned ties = 0;
-  for (const Value& uuid : *uuids) {
-    const KXSAssetPtr* host = uuidToKXSAsset_->find(*uuid.asString(kKXSAlbumAssetUUIDsKey));
+  for (std::size_t i = 0; i < uuids->size(); ++i) {
+    const KXSAssetPtr* host = uuidToKXSAsset_->find(*uuids->stringAt(i, kKXSAlbumAssetUUIDsKey));
     if (host == nullptr) continue;
     const double time = secondsOf((*host)->exposureDate());
     ties = std::fabs(previous - time) < kTokenEpsilon ? ties + 1 : 0;

@@ -26,8 +26,8 @@ std::vector<Memberships::Membership> Memberships::membershipsIn(
     const std::optional<ArrayView> uuids = album->assetUUIDs();
     if (!uuids) continue;
     const std::uint32_t number = numberOf(entry.key);
-    for (const Value& uuid : *uuids) {
-      const std::uint32_t* pair = pairsByUUID.find(*uuid.asString(kKXSAlbumAssetUUIDsKey));
+    for (std::size_t i = 0; i < uuids->size(); ++i) {
+      const std::uint32_t* pair = pairsByUUID.find(*uuids->stringAt(i, kKXSAlbumAssetUUIDsKey));
       if (pair != nullptr) found.push_back({*pair, number});
     }
   }

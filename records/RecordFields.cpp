@@ -64,26 +64,16 @@ bool RecordFields::isNull(std::size_t slot) const {
   return values_ ? (*values_)[slot].isNull() : positions_[slot] == kAbsent;
 }
 
-OptionalString RecordFields::string(std::size_t slot, std::string_view key) const {
+OptionalString RecordFields::anyString(std::size_t slot, std::string_view key) const {
   if (values_) return (*values_)[slot].asString(key);
   if (positions_[slot] == kAbsent) return std::nullopt;
-  if (EntryPeek::can(dictionary_)) {
-    const EntryPeek entry = EntryPeek::valueOf(dictionary_, positions_[slot]);
-    if (entry.kind() == Kind::kString) return entry.text();
-    throw TypeError(key, kindName(Kind::kString), kindName(entry.kind()));
-  }
   // The text belongs to the dictionary's storage, not to the handle made here.
   return dictionary_.dictionaryValue().valueAt(positions_[slot]).asString(key);
 }
 
-std::optional<Number> RecordFields::number(std::size_t slot, std::string_view key) const {
+std::optional<Number> RecordFields::anyNumber(std::size_t slot, std::string_view key) const {
   if (values_) return (*values_)[slot].asNumber(key);
   if (positions_[slot] == kAbsent) return std::nullopt;
-  if (EntryPeek::can(dictionary_)) {
-    const EntryPeek entry = EntryPeek::valueOf(dictionary_, positions_[slot]);
-    if (entry.kind() == Kind::kNumber) return entry.number();
-    throw TypeError(key, kindName(Kind::kNumber), kindName(entry.kind()));
-  }
   return dictionary_.dictionaryValue().valueAt(positions_[slot]).asNumber(key);
 }
 

@@ -8,6 +8,7 @@
 #include <span>
 #include <string_view>
 
+#include "platform/foundation/EntryPeek.h"
 #include "platform/foundation/Value.h"
 
 namespace kx {
@@ -45,8 +46,20 @@ class RecordFields {
   Value value(std::size_t slot) const;
   bool isNull(std::size_t slot) const;
   // Readings that raise TypeError naming `key`; null stays null. Views live as long as the field.
-  OptionalString string(std::size_t slot, std::string_view key) const;
-  std::optional<Number> number(std::size_t slot, std::string_view key) const;
+  OptionalString string(std::size_t slot, std::string_view key) const {
+    if (canPeek(slot)) {
+      const EntryPeek entry = EntryPeek::valueOf(dictionary_, positions_[slot]);
+      if (entry.kind() == Kind::kString) return entry.text();
+    }
+    return anyString(slot, key);
+  }
+  std::optional<Number> number(std::size_t slot, std::string_view key) const {
+    if (canPeek(slot)) {
+      const EntryPeek entry = EntryPeek::valueOf(dictionary_, positions_[slot]);
+      if (entry.kind() == Kind::kNumber) return entry.number();
+    }
+    return anyNumber(slot, key);
+  }
   // Elements of an array; 0 for everything else.
   std::size_t count(std::size_t slot) const;
   // Whether two slots were read from one and the same entry.
@@ -64,6 +77,11 @@ class RecordFields {
  private:
   using Values = std::array<Value, kSlots>;
   void detach();
+  bool canPeek(std::size_t slot) const {
+    return !values_ && positions_[slot] != kAbsent && EntryPeek::can(dictionary_);
+  }
+  OptionalString anyString(std::size_t slot, std::string_view key) const;
+  std::optional<Number> anyNumber(std::size_t slot, std::string_view key) const;
 
   Value dictionary_;
   Positions positions_ = kNowhere;

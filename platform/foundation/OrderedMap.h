@@ -29,7 +29,7 @@ class OrderedMap {
   bool empty() const { return live_ == 0; }
   void reserve(std::size_t count) {
     entries_.reserve(count);
-    if (count * 2 > slots_.size()) rehash(count);
+    if (count * 2 > slots_.size()) rehash((count + 1) / 2);
   }
   void clear() {
     entries_.clear();
@@ -39,40 +39,47 @@ class OrderedMap {
   }
 
   T* find(std::string_view key) {
-    const std::size_t slot = findSlot(key);
-    return slot == kNone ? nullptr : &entries_[slots_[slot] - 1].value;
+    const std::uint32_t place = placeOf(key);
+    return place == 0 ? nullptr : &entries_[place - 1].value;
   }
   const T* find(std::string_view key) const {
-    const std::size_t slot = findSlot(key);
-    return slot == kNone ? nullptr : &entries_[slots_[slot] - 1].value;
+    const std::uint32_t place = placeOf(key);
+    return place == 0 ? nullptr : &entries_[place - 1].value;
   }
-  bool contains(std::string_view key) const { return findSlot(key) != kNone; }
+  bool contains(std::string_view key) const { return placeOf(key) != 0; }
 
   // Sets or replaces. The key must be a string value.
   T& set(Value key, T value) {
     const std::string_view text = key.stringValue();
-    if (const std::size_t slot = findSlot(text); slot != kNone) {
-      Entry& entry = entries_[slots_[slot] - 1];
+    const std::uint64_t hash = hashText(text);
+    if (slots_.empty()) rehash(1);
+    std::size_t at = probe(text, hash);
+    if (slots_[at].place != 0) {
+      Entry& entry = entries_[slots_[at].place - 1];
       entry.value = std::move(value);
       return entry.value;
     }
     // Removed entries keep their place and their slot until the next rehash, so they count here: at
     // most half of the slots are ever taken and every probe meets a free one.
-    if ((entries_.size() + 1) * 2 > slots_.size()) rehash(live_ + 1);
+    if ((entries_.size() + 1) * 2 > slots_.size()) {
+      rehash(live_ + 1);
+      at = probe(text, hash);
+    }
     entries_.push_back(Entry{std::move(key), std::move(value)});
-    link(entries_.size() - 1);
+    slots_[at] = Slot{static_cast<std::uint32_t>(entries_.size()), tagOf(hash)};
     ++live_;
     return entries_.back().value;
   }
   T& set(std::string_view key, T value) { return set(Value::string(key), std::move(value)); }
 
   bool remove(std::string_view key) {
-    const std::size_t slot = findSlot(key);
-    if (slot == kNone) return false;
-    Entry& entry = entries_[slots_[slot] - 1];
+    if (slots_.empty()) return false;
+    Slot& slot = slots_[probe(key, hashText(key))];
+    if (slot.place == 0) return false;
+    Entry& entry = entries_[slot.place - 1];
     entry.key = Value();
     entry.value = T();
-    slots_[slot] = kTombstone;
+    slot.place = kTombstone;
     --live_;
     while (first_ < entries_.size() && entries_[first_].key.isNull()) ++first_;
     return true;
@@ -107,27 +114,38 @@ class OrderedMap {
   const_iterator end() const { return {this, entries_.size()}; }
 
  private:
-  static constexpr std::size_t kNone = static_cast<std::size_t>(-1);
+  // Index into entries_ plus 1, 0 when free; and a part of the hash that the place does not tell,
+  // so that other keys are not looked at.
+  struct Slot {
+    std::uint32_t place = 0;
+    std::uint32_t tag = 0;
+  };
   static constexpr std::uint32_t kTombstone = static_cast<std::uint32_t>(-1);
 
-  static std::size_t hashOf(std::string_view key) {
-    return static_cast<std::size_t>(hashText(key));
-  }
+  static std::uint32_t tagOf(std::uint64_t hash) { return static_cast<std::uint32_t>(hash >> 32); }
 
-  std::size_t findSlot(std::string_view key) const {
-    if (slots_.empty()) return kNone;
+  // The slot of the key, or the free one where it would go. There must be a free one.
+  std::size_t probe(std::string_view key, std::uint64_t hash) const {
     const std::size_t mask = slots_.size() - 1;
-    for (std::size_t slot = hashOf(key) & mask;; slot = (slot + 1) & mask) {
-      const std::uint32_t stored = slots_[slot];
-      if (stored == 0) return kNone;
-      if (stored != kTombstone && entries_[stored - 1].key.stringValue() == key) return slot;
+    for (std::size_t at = static_cast<std::size_t>(hash) & mask;; at = (at + 1) & mask) {
+      const Slot& slot = slots_[at];
+      if (slot.place == 0) return at;
+      if (slot.tag == tagOf(hash) && slot.place != kTombstone &&
+          entries_[slot.place - 1].key.stringValue() == key) {
+        return at;
+      }
     }
   }
+  // 0 when it is not there.
+  std::uint32_t placeOf(std::string_view key) const {
+    return slots_.empty() ? 0 : slots_[probe(key, hashText(key))].place;
+  }
   void link(std::size_t index) {
+    const std::uint64_t hash = hashText(entries_[index].key.stringValue());
     const std::size_t mask = slots_.size() - 1;
-    std::size_t slot = hashOf(entries_[index].key.stringValue()) & mask;
-    while (slots_[slot] != 0) slot = (slot + 1) & mask;
-    slots_[slot] = static_cast<std::uint32_t>(index + 1);
+    std::size_t at = static_cast<std::size_t>(hash) & mask;
+    while (slots_[at].place != 0) at = (at + 1) & mask;
+    slots_[at] = Slot{static_cast<std::uint32_t>(index + 1), tagOf(hash)};
   }
   // Drops the places of removed entries and builds the table anew with room for twice `count`
   // entries: at least `count` further insertions go by before the next time.
@@ -138,12 +156,12 @@ class OrderedMap {
     std::size_t capacity = 16;
     while (capacity < std::max(count, live_) * 4) capacity *= 2;
     first_ = 0;
-    slots_.assign(capacity, 0);
+    slots_.assign(capacity, Slot());
     for (std::size_t i = 0; i < entries_.size(); ++i) link(i);
   }
 
   std::vector<Entry> entries_;
-  std::vector<std::uint32_t> slots_;  // index into entries_ plus 1; 0 is free
+  std::vector<Slot> slots_;
   std::size_t live_ = 0;
   std::size_t first_ = 0;  // no entry before it is live
 };

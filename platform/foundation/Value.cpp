@@ -242,6 +242,18 @@ Value Value::operator[](std::string_view key) const {
 
 std::size_t ArrayView::size() const { return ValueAccess::size(value_); }
 
+OptionalString ArrayView::stringAt(std::size_t index, std::string_view key) const {
+  if (index >= size()) throw InternalInconsistency("array index out of bounds");
+  const PropertyListDocument* document = ValueAccess::document(value_);
+  if (document == nullptr) return ValueAccess::elements(value_)[index].asString(key);
+  const DocumentNode& node =
+      document->node(document->reference(document->node(ValueAccess::objectIndex(value_)), index));
+  if (node.kind != Kind::kString) {
+    throw TypeError(key, kindName(Kind::kString), kindName(node.kind));
+  }
+  return document->text(node);
+}
+
 Value ArrayView::operator[](std::size_t index) const {
   if (index >= size()) throw InternalInconsistency("array index out of bounds");
   if (const PropertyListDocument* document = ValueAccess::document(value_)) {

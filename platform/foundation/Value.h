@@ -204,6 +204,9 @@ class ArrayView {
   std::size_t size() const;
   bool empty() const { return size() == 0; }
   Value operator[](std::size_t index) const;
+  // The text of an element as its asString gives it, without making a value; it lives as long as
+  // the array.
+  OptionalString stringAt(std::size_t index, std::string_view key) const;
 
   class Iterator {
    public:

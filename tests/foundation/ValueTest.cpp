@@ -94,6 +94,19 @@ TEST(Value, ViewsKeepTheirStorage) {
   EXPECT_EQ(fields.find("count"), Value::integer(3));
 }
 
+TEST(Value, TextsOfAnArrayAreReadWithoutValues) {
+  const Value built = Value::dictionary(
+      {{"list", Value::array({Value::string("a"), Value::string(""), Value::integer(1)})}});
+  const Value read = readBytes(written(built)).value;
+  for (const Value& value : {built, read}) {
+    const ArrayView list = value["list"].arrayValue();
+    EXPECT_EQ(list.stringAt(0, "list"), OptionalString("a"));
+    EXPECT_EQ(list.stringAt(1, "list"), OptionalString(""));
+    EXPECT_THROW(list.stringAt(2, "list"), TypeError);
+    EXPECT_THROW(list.stringAt(3, "list"), InternalInconsistency);
+  }
+}
+
 TEST(Value, EqualWhateverItIsMadeOf) {
   EXPECT_EQ(sample(), sampleFromFile());
   EXPECT_EQ(sampleFromFile(), sample());
