@@ -1,10 +1,12 @@
 #include "device/SnapshotAssets.h"
 
 #include <algorithm>
+#include <string>
 
 #include "platform/foundation/EntryPeek.h"
 #include "platform/foundation/Exceptions.h"
 #include "platform/foundation/Hash.h"
+#include "platform/foundation/Limits.h"
 
 namespace kx {
 namespace {
@@ -81,7 +83,7 @@ class ItemPeek {
 
 }  // namespace
 
-SnapshotAssets::SnapshotAssets(std::size_t most) {
+SnapshotAssets::SnapshotAssets(std::size_t most) : most_(most) {
   std::size_t slots = 16;
   while (slots < most * 2) slots *= 2;
   slots_.resize(slots);
@@ -92,13 +94,17 @@ std::optional<SnapshotAssets> SnapshotAssets::of(const Value& root, std::string*
   try {
     const std::optional<ArrayView> updates = root["updates"].asArray("updates");
     const std::size_t count = updates ? updates->size() : 0;
-    SnapshotAssets assets(count);
+    // The list may name one item any number of times.
+    SnapshotAssets assets(std::min(count, static_cast<std::size_t>(limits::kAssets)));
     ItemPeek peek;
     for (std::size_t i = 0; i < count; ++i) {
       const Value item = (*updates)[i];
       std::optional<Item> read;
       if (!peek.read(item, &read)) read = readItem(item);
-      if (read) assets.set(read->uuid, read->modified);
+      if (read && !assets.set(read->uuid, read->modified)) {
+        *why = "the snapshot lists more than " + std::to_string(limits::kAssets) + " assets";
+        return std::nullopt;
+      }
     }
     return assets;
   } catch (const TypeError& problem) {
@@ -114,14 +120,16 @@ std::size_t SnapshotAssets::slotOf(std::string_view uuid) const {
   return slot;
 }
 
-void SnapshotAssets::set(std::string_view uuid, double modified) {
+bool SnapshotAssets::set(std::string_view uuid, double modified) {
   const std::size_t slot = slotOf(uuid);
   if (slots_[slot] != 0) {
     assets_[slots_[slot] - 1].modified = modified;
-    return;
+    return true;
   }
+  if (assets_.size() == most_) return false;
   assets_.push_back({uuid, modified, false});
   slots_[slot] = static_cast<std::uint32_t>(assets_.size());
+  return true;
 }
 
 SnapshotAssets::Asset* SnapshotAssets::find(std::string_view uuid) {

@@ -22,7 +22,7 @@ class SnapshotAssets {
     bool proved = false;
   };
 
-  // Null, and why, when the snapshot makes no sense.
+  // Null, and why, when the snapshot makes no sense or lists more assets than a library may have.
   static std::optional<SnapshotAssets> of(const Value& root, std::string* why);
 
   // Null when the snapshot does not list it.
@@ -32,9 +32,11 @@ class SnapshotAssets {
 
  private:
   explicit SnapshotAssets(std::size_t most);
-  void set(std::string_view uuid, double modified);
+  // False when there are as many as there may be.
+  bool set(std::string_view uuid, double modified);
   std::size_t slotOf(std::string_view uuid) const;
 
+  const std::size_t most_;
   std::vector<Asset> assets_;
   std::vector<std::uint32_t> slots_;  // index into assets_ plus 1, 0 when free; half are free
 };
