@@ -98,7 +98,7 @@ function(_kx_sanitized_test folder tests all_concurrent concurrent)
     set(concurrent TRUE)
   else()
     add_test(NAME ${folder} COMMAND test_${folder} --gtest_brief=1 "--gtest_filter=-${patterns}")
-    set_tests_properties(${folder} PROPERTIES TIMEOUT 1500 LABELS ${folder})
+    set_tests_properties(${folder} PROPERTIES TIMEOUT 1500 LABELS ${folder} COST 2)
   endif()
   if(concurrent)
     add_test(NAME ${folder}.concurrency
@@ -168,6 +168,7 @@ endfunction()
 
 # kx_python_test(FOLDER): each tests/FOLDER/*_test.py, test_*.py or *Test.py is an entry of ctest,
 # "FOLDER.<name>". KX_BIN names the directory of the programs, KX_MAKE_SAMPLE the sample's maker.
+# ctest starts what costs most first, so that the longest do not run alone at the end.
 function(kx_python_test folder)
   set(here ${PROJECT_SOURCE_DIR}/tests/${folder})
   file(GLOB scripts CONFIGURE_DEPENDS ${here}/*_test.py ${here}/test_*.py ${here}/*Test.py)
@@ -177,5 +178,8 @@ function(kx_python_test folder)
     set_tests_properties(${folder}.${name} PROPERTIES LABELS ${folder} TIMEOUT 900
       WORKING_DIRECTORY ${here}
       ENVIRONMENT "KX_BIN=${CMAKE_RUNTIME_OUTPUT_DIRECTORY};KX_MAKE_SAMPLE=$<TARGET_FILE:make-sample-library>")
+    if(name MATCHES "^test_(restore|interruption|backup)$")
+      set_tests_properties(${folder}.${name} PROPERTIES COST 3)
+    endif()
   endforeach()
 endfunction()
