@@ -2,9 +2,9 @@
 
 #include <cstdint>
 #include <string_view>
-#include <unordered_map>
 #include <vector>
 
+#include "platform/foundation/TextNumbers.h"
 #include "platform/foundation/Value.h"
 #include "transport/KXSLibraryChangeSnapshot.h"
 
@@ -24,9 +24,27 @@ class ContainerIndex {
                                              OptionalString eventUUID) const;
 
  private:
+  // The places of the containers that go with one text, ascending.
+  class Places {
+   public:
+    explicit Places(std::size_t expected) : texts_(expected) {}
+    // Places come in ascending order; the same again counts once.
+    void add(std::string_view text, std::uint32_t place);
+    std::vector<std::uint32_t> of(std::string_view text) const;
+
+   private:
+    struct Link {
+      std::uint32_t place;
+      std::uint32_t before;  // its number, kNone for a text's first
+    };
+    TextNumbers texts_;
+    std::vector<std::uint32_t> lasts_;  // by a text's number: that of its last link
+    std::vector<Link> links_;
+  };
+
   std::vector<std::string_view> keys_;
-  std::unordered_map<std::string_view, std::vector<std::uint32_t>> albumsByAsset_;
-  std::unordered_map<std::string_view, std::vector<std::uint32_t>> eventsByUUID_;
+  Places albums_;  // by asset
+  Places events_;  // by their own identifiers
 };
 
 }  // namespace kx

@@ -1,7 +1,6 @@
-#include <unordered_set>
-
 #include "client/KXSyncClient.h"
 #include "client/LogSource.h"
+#include "platform/foundation/TextNumbers.h"
 
 namespace kx {
 namespace {
@@ -74,18 +73,13 @@ void KXSyncClient::setPendingCountsInTransaction() {
 
 void KXSyncClient::countPendingAssets(const TransferList& outstanding) {
   // Each identifier once, the empty one never.
-  std::unordered_set<std::string_view> identifiers;
-  std::vector<std::string_view> inOrder;
-  identifiers.reserve(outstanding.size());
+  TextNumbers identifiers(outstanding.size());
   for (const FRAssetPtr& request : outstanding) {
-    const std::string_view identifier = request->identifier();
-    if (!identifier.empty() && identifiers.insert(identifier).second) {
-      inOrder.push_back(identifier);
-    }
+    if (!request->identifier().empty()) identifiers.add(request->identifier());
   }
-  if (inOrder.empty() || !albumsAndEvents_) return;
+  if (identifiers.empty() || !albumsAndEvents_) return;
 
-  for (const std::string_view identifier : inOrder) {
+  for (const std::string_view identifier : identifiers.texts()) {
     const KXSAssetPtr* asset = uuidToKXSAsset_ ? uuidToKXSAsset_->find(identifier) : nullptr;
     const OptionalString event = asset != nullptr ? (*asset)->eventUUID() : OptionalString();
     if (!event || event->empty()) continue;
@@ -98,8 +92,8 @@ void KXSyncClient::countPendingAssets(const TransferList& outstanding) {
     if (album == nullptr) continue;
     const std::optional<ArrayView> assets = album->assetUUIDs();
     if (!assets) continue;
-    for (const Value& uuid : *assets) {
-      if (identifiers.contains(*uuid.asString(kKXSAlbumAssetUUIDsKey))) {
+    for (std::size_t i = 0; i < assets->size(); ++i) {
+      if (identifiers.contains(*assets->stringAt(i, kKXSAlbumAssetUUIDsKey))) {
         _incrementPendingCountForContainerUUID(entry.key);
       }
     }

@@ -58,19 +58,20 @@ void compareAssets(const CheckedSnapshot& snapshot, KXPhotoLibrary& library,
   const auto assets = library.managedObjectContext().fetchAssets(request, error);
   if (!assets) return;
   comparison->syncedAssets = assets->size();
-  std::unordered_set<std::string_view> present;
-  present.reserve(assets->size());
+  std::vector<bool> isPresent(snapshot.assetUUIDs.size());
+  std::uint32_t next = 0;
   for (const KXManagedAssetPtr& asset : *assets) {
     const OptionalString uuid = asset->uuid();
-    const auto listed = uuid ? snapshot.assetUUIDs.find(*uuid) : snapshot.assetUUIDs.end();
-    if (listed == snapshot.assetUUIDs.end()) {
+    const std::uint32_t listed = uuid ? snapshot.assetUUIDs.find(*uuid, next) : TextNumbers::kNone;
+    if (listed == TextNumbers::kNone) {
       ++comparison->unlisted;
     } else {
-      present.insert(*listed);
+      isPresent[listed] = true;
+      next = listed + 1;
     }
   }
-  for (const std::string_view uuid : snapshot.assetUUIDs) {
-    if (!present.contains(uuid)) comparison->newAssets.push_back(uuid);
+  for (std::size_t number = 0; number < isPresent.size(); ++number) {
+    if (!isPresent[number]) comparison->newAssets.push_back(snapshot.assetUUIDs.texts()[number]);
   }
 }
 

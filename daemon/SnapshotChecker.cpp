@@ -177,7 +177,7 @@ class Checker {
     if (value.isNull()) return;
     const ArrayView items = value.arrayValue();
     if (items.size() > limits::kAssets + limits::kContainers) overLimit("items", items.size());
-    if (areUpdates) result_.assetUUIDs.reserve(items.size());
+    if (areUpdates) result_.assetUUIDs = TextNumbers(items.size());
     list_ = list;
     for (index_ = 0; index_ < items.size(); ++index_) checkItem(items[index_], areUpdates);
   }
@@ -205,7 +205,7 @@ class Checker {
   void note(bool isAsset) {
     if (uuid_->empty()) return;
     if (isAsset) {
-      result_.assetUUIDs.insert(*uuid_);
+      result_.assetUUIDs.add(*uuid_);
     } else {
       result_.containerUUIDs.push_back(*uuid_);
     }

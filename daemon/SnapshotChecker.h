@@ -4,11 +4,11 @@
 #include <optional>
 #include <string>
 #include <string_view>
-#include <unordered_set>
 #include <vector>
 
 #include "platform/foundation/Data.h"
 #include "platform/foundation/Error.h"
+#include "platform/foundation/TextNumbers.h"
 #include "platform/foundation/Value.h"
 
 namespace kx {
@@ -18,7 +18,7 @@ namespace kx {
 struct CheckedSnapshot {
   Value root;
   std::string libraryUUID;
-  std::unordered_set<std::string_view> assetUUIDs;
+  TextNumbers assetUUIDs;
   std::vector<std::string_view> containerUUIDs;  // albums and events, in file order
 };
 

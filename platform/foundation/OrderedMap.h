@@ -48,6 +48,29 @@ class OrderedMap {
   }
   bool contains(std::string_view key) const { return placeOf(key) != 0; }
 
+  // Where a run of look-ups has come to. Keys that are asked for in the order of the entries are
+  // found without a probe.
+  class Cursor {
+   public:
+    // The number of the entry found last: below places(), the same until the next set or remove.
+    std::size_t place() const { return next_ - 1; }
+
+   private:
+    friend class OrderedMap;
+    std::size_t next_ = 0;
+  };
+  std::size_t places() const { return entries_.size(); }
+  const Entry* find(std::string_view key, Cursor& cursor) const {
+    if (cursor.next_ < entries_.size()) {
+      const Value& next = entries_[cursor.next_].key;
+      if (!next.isNull() && next.stringValue() == key) return &entries_[cursor.next_++];
+    }
+    const std::uint32_t place = placeOf(key);
+    if (place == 0) return nullptr;
+    cursor.next_ = place;
+    return &entries_[place - 1];
+  }
+
   // Sets or replaces. The key must be a string value.
   T& set(Value key, T value) {
     const std::string_view text = key.stringValue();

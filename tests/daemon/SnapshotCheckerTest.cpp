@@ -176,7 +176,7 @@ TEST(SnapshotCheckerTest, ListsIdentifiersOnceAndLeavesOutEmptyOnes) {
   const auto checked = checkSnapshot(plistBytes(root), &error);
   ASSERT_TRUE(checked) << error->description();
   EXPECT_EQ(checked->libraryUUID, "11111111-1111-1111-1111-111111111111");
-  EXPECT_THAT(checked->assetUUIDs, testing::UnorderedElementsAre("A1", "\xc3\xa4sset"));
+  EXPECT_THAT(checked->assetUUIDs.texts(), testing::ElementsAre("A1", "\xc3\xa4sset"));
   EXPECT_THAT(checked->containerUUIDs, testing::ElementsAre("B1", "B1"));
 }
 

@@ -35,6 +35,27 @@ TEST(OrderedMap, KeepsOrderThroughReplacementAndRemoval) {
   EXPECT_FALSE(map.contains("a"));
 }
 
+TEST(OrderedMap, ACursorFindsEveryKeyInAnyOrder) {
+  OrderedMap<int> map;
+  for (int i = 0; i < 100; ++i) map.set("key " + std::to_string(i), i);
+  map.remove("key 50");
+  OrderedMap<int>::Cursor cursor;
+  for (const int step : {1, 7, 99}) {
+    for (int i = 0; i < 100; ++i) {
+      const int number = i * step % 100;
+      const auto* found = map.find("key " + std::to_string(number), cursor);
+      ASSERT_EQ(found == nullptr, number == 50) << number;
+      if (found == nullptr) continue;
+      EXPECT_EQ(found->value, number);
+      EXPECT_EQ(cursor.place(), static_cast<std::size_t>(number));
+    }
+    EXPECT_EQ(map.find("missing", cursor), nullptr);
+  }
+  EXPECT_EQ(map.places(), 100U);
+  OrderedMap<int> empty;
+  EXPECT_EQ(empty.find("", cursor), nullptr);
+}
+
 TEST(OrderedMap, EmptyKeyIsAKey) {
   OrderedMap<int> map;
   map.set("", 1);
