@@ -78,7 +78,8 @@ struct KXSyncClient::AssetReconciliation {
   DeviceAssetMap deviceAssets;
   DeviceAlbumMap deviceAlbums;
   const KXSAssetMap* hostAssets = nullptr;
-  Memberships memberships;
+  std::optional<Memberships> memberships;
+  OrderedMap<double>::Cursor nextToken;
 };
 
 std::optional<KXSyncClient::DeviceAssetMap> KXSyncClient::_onDeviceAssetsByUUID() {
@@ -95,13 +96,26 @@ std::optional<KXSyncClient::DeviceAssetMap> KXSyncClient::_onDeviceAssetsByUUID(
   }
   DeviceAssetMap map;
   map.reserve(assets->size());
+  static const KXSAssetMap kNoAssets;
+  const KXSAssetMap& hostAssets = uuidToKXSAsset_ ? *uuidToKXSAsset_ : kNoAssets;
+  KXSAssetMap::Cursor cursor;
   for (const KXManagedAssetPtr& asset : *assets) {
-    if (const OptionalString uuid = asset->uuid()) map.set(*uuid, asset);
+    const OptionalString uuid = asset->uuid();
+    if (!uuid) continue;
+    const KXSAssetMap::Entry* host = hostAssets.find(*uuid, cursor);
+    map.set(host != nullptr ? host->key : Value::string(*uuid), asset);
   }
   return map;
 }
 
 void KXSyncClient::_reconcileAssets(const DispatchGroupPtr& group) {
+  // Neither depends on the device, so both are made while the transaction before is still at work.
+  hostMemberships_ =
+      std::async(std::launch::async, [assets = uuidToKXSAsset_, containers = albumsAndEvents_] {
+        static const KXSAssetMap kNoAssets;
+        static const KXSItemMap kNoContainers;
+        return Memberships(assets ? *assets : kNoAssets, containers ? *containers : kNoContainers);
+      });
   computeSortTokens();
   submitTransaction(group, [this] { reconcileAssetsInTransaction(); });
 }
@@ -112,14 +126,17 @@ void KXSyncClient::computeSortTokens() {
   const std::optional<ArrayView> uuids = masterAlbum_->assetUUIDs();
   if (!uuids) return;
   sortTokens_->reserve(uuids->size());
+  KXSAssetMap::Cursor cursor;
   double previous = kNoPreviousTime;
   unsigned ties = 0;
   for (std::size_t i = 0; i < uuids->size(); ++i) {
-    const KXSAssetPtr* host = uuidToKXSAsset_->find(*uuids->stringAt(i, kKXSAlbumAssetUUIDsKey));
-    if (host == nullptr) continue;
-    const double time = secondsOf((*host)->exposureDate());
+    const KXSAssetMap::Entry* found =
+        uuidToKXSAsset_->find(*uuids->stringAt(i, kKXSAlbumAssetUUIDsKey), cursor);
+    if (found == nullptr) continue;
+    const KXSAsset& host = *found->value;
+    const double time = secondsOf(host.exposureDate());
     ties = std::fabs(previous - time) < kTokenEpsilon ? ties + 1 : 0;
-    const Value key = (*host)->uuidValue();
+    const Value key = host.uuidValue();
     if (!key.isNull()) sortTokens_->set(key, time + ties / kTieStepDivisor);
     previous = time;
   }
@@ -142,8 +159,9 @@ void KXSyncClient::reconcileAssetsInTransaction() {
 
 void KXSyncClient::deleteAssets(AssetReconciliation& run) {
   std::vector<Value> doomed;
+  KXSAssetMap::Cursor cursor;
   for (const auto& entry : run.deviceAssets) {
-    if (isResync_ || !run.hostAssets->contains(entry.key.stringValue())) {
+    if (isResync_ || run.hostAssets->find(entry.key.stringValue(), cursor) == nullptr) {
       doomed.push_back(entry.key);
     }
   }
@@ -165,9 +183,12 @@ void KXSyncClient::deleteAssets(AssetReconciliation& run) {
 }
 
 void KXSyncClient::requestNewAssets(AssetReconciliation& run) {
+  DeviceAssetMap::Cursor cursor;
   for (const auto& entry : *run.hostAssets) {
     const std::string_view uuid = entry.key.stringValue();
-    if (isResync_ || !run.deviceAssets.contains(uuid)) requestDownload(uuid, *entry.value);
+    if (isResync_ || run.deviceAssets.find(uuid, cursor) == nullptr) {
+      requestDownload(uuid, *entry.value);
+    }
   }
 }
 
@@ -185,29 +206,33 @@ void KXSyncClient::updateAssets(AssetReconciliation& run) {
   // The assets that both sides have, in row order; all that are left on the device by now.
   std::vector<AssetPair> pairs;
   pairs.reserve(run.deviceAssets.size());
+  KXSAssetMap::Cursor cursor;
   for (const auto& entry : run.deviceAssets) {
-    if (const KXSAssetPtr* host = run.hostAssets->find(entry.key.stringValue())) {
-      pairs.push_back({entry.key, entry.value, host->get()});
-    }
+    const KXSAssetMap::Entry* host = run.hostAssets->find(entry.key.stringValue(), cursor);
+    if (host != nullptr) pairs.push_back({&entry.value, host, cursor.place()});
   }
-  run.memberships.build(pairs, albumsAndEvents_.get());
+  run.memberships = hostMemberships_.get();
+  run.memberships->setPairs(pairs);
   for (std::size_t i = 0; i < pairs.size(); ++i) {
     const AssetPair& pair = pairs[i];
-    const std::string_view uuid = pair.uuid.stringValue();
-    if (deleteAssetIfStale(run, uuid, *pair.host, pair.device)) continue;
-    updateSortToken(*pair.device, uuid);
-    updateLocation(*pair.device, *pair.host);
-    updateFaces(*pair.device, *pair.host);
-    updateAlbums(run, i, uuid, pair.device);
+    const std::string_view uuid = pair.host->key.stringValue();
+    const KXSAsset& host = *pair.host->value;
+    const KXManagedAssetPtr& device = *pair.device;
+    if (deleteAssetIfStale(run, uuid, host, device)) continue;
+    updateSortToken(run, *device, uuid);
+    updateLocation(*device, host);
+    updateFaces(*device, host);
+    updateAlbums(run, i, uuid, device);
   }
 }
 
 bool KXSyncClient::deleteAssetIfStale(AssetReconciliation& run, std::string_view uuid,
-                                      const KXSAsset& host, const KXManagedAssetPtr& device) {
-  const std::optional<Date> onDevice = device->modificationDate();
+                                      const KXSAsset& host, const KXManagedAssetPtr& present) {
+  const std::optional<Date> onDevice = present->modificationDate();
   if (onDevice && onDevice->secondsSinceReference == secondsOf(host.modificationDate())) {
     return false;
   }
+  const KXManagedAssetPtr device = present;  // which goes with its entry
   KX_LOG(kClientSource, kReconcileAssets, LogLevel::kInfo, "Deleting stale asset: %@", device);
   run.deviceAssets.remove(uuid);
   deleteWithFaces(*device);
@@ -218,11 +243,13 @@ bool KXSyncClient::deleteAssetIfStale(AssetReconciliation& run, std::string_view
   return true;
 }
 
-void KXSyncClient::updateSortToken(KXManagedAsset& device, std::string_view uuid) {
-  const double* token = sortTokens_ ? sortTokens_->find(uuid) : nullptr;
-  if (token == nullptr) return;
+void KXSyncClient::updateSortToken(AssetReconciliation& run, KXManagedAsset& device,
+                                   std::string_view uuid) {
+  const auto* found = sortTokens_ ? sortTokens_->find(uuid, run.nextToken) : nullptr;
+  if (found == nullptr) return;
+  const double token = found->value;
   const std::optional<double> present = device.sortToken();
-  if (!present || std::fabs(*present - *token) >= kTokenEpsilon) device.setSortToken(*token);
+  if (!present || std::fabs(*present - token) >= kTokenEpsilon) device.setSortToken(token);
 }
 
 void KXSyncClient::updateLocation(KXManagedAsset& device, const KXSAsset& host) {
@@ -261,7 +288,7 @@ void KXSyncClient::updateFaces(KXManagedAsset& device, const KXSAsset& host) {
 
 void KXSyncClient::updateAlbums(AssetReconciliation& run, std::size_t index, std::string_view uuid,
                                 const KXManagedAssetPtr& device) {
-  const MembershipChanges& changes = run.memberships.changesFor(index, device->albums());
+  const MembershipChanges& changes = run.memberships->changesFor(index, device->albums());
   for (const Value& key : changes.toLeave) {
     const KXGenericAlbumPtr* found = run.deviceAlbums.find(key.stringValue());
     const KXGenericAlbumPtr album = found != nullptr ? *found : nullptr;

@@ -1,6 +1,7 @@
 #include "client/KXSyncClient.h"
 
 #include <exception>
+#include <future>
 
 #include "client/LogSource.h"
 #include "platform/foundation/PropertyList.h"
@@ -36,8 +37,8 @@ bool KXSyncClient::reconcileSync(std::uint32_t syncType, const std::string& newA
   _initializeLibrary();
 
   ErrorPtr decoderError;
-  DataPtr bytes;
-  const KXSLibraryChangeSnapshotPtr snapshot = decodeNewSnapshot(&bytes, error, &decoderError);
+  std::future<PreviousSnapshot> previous;
+  const KXSLibraryChangeSnapshotPtr snapshot = decodeNewSnapshot(&previous, error, &decoderError);
   KX_LOG(kClientSource, kReconcileFunction, LogLevel::kError, "snapshot %@ err: %@", snapshot,
          decoderError);
   if (decoderError) {
@@ -55,8 +56,7 @@ bool KXSyncClient::reconcileSync(std::uint32_t syncType, const std::string& newA
   _initializeOutstandingAssets();
 
   std::optional<std::string> previousUUID;
-  const bool isNullSync = equalsPreviousSnapshot(*snapshot, bytes, &previousUUID);
-  bytes.reset();
+  const bool isNullSync = equalsPreviousSnapshot(*snapshot, previous.get(), &previousUUID);
   const bool isResync = decideResync(previousUUID, *snapshot);
   Dictionary current;
   current.setIfPresent(kLibraryUUID, Value::optionalString(snapshot->libraryUUID()));
@@ -72,17 +72,24 @@ bool KXSyncClient::reconcileSync(std::uint32_t syncType, const std::string& newA
 }
 
 // Reads and decodes the snapshot file and keeps what the host said about itself. Null when nothing
-// could be decoded; the reader's error goes to `error`. `bytes` are the file's, null when another
-// decoder than ours has made something of them.
-KXSLibraryChangeSnapshotPtr KXSyncClient::decodeNewSnapshot(DataPtr* bytes, ErrorPtr* error,
+// could be decoded; the reader's error goes to `error`. `previous` is set with it: the snapshot of
+// the last completed sync is read meanwhile.
+KXSLibraryChangeSnapshotPtr KXSyncClient::decodeNewSnapshot(std::future<PreviousSnapshot>* previous,
+                                                            ErrorPtr* error,
                                                             ErrorPtr* decoderError) {
   KX_LOG(kClientSource, kReconcileFunction, LogLevel::kInfo, "Loading up change snapshot");
   KX_LOG(kClientSource, kReconcileFunction, LogLevel::kInfo, "Sync url %@",
          std::string(kFileURLScheme) + kKXSnapshotPath);
   const std::shared_ptr<KXSTransportDecoder> own = KXSTransportDecoder::decoder();
   const std::shared_ptr<KXSTransportDecoder> decoder = platform_.snapshotDecoder(own);
-  DataPtr* const read = decoder == own ? bytes : nullptr;
-  const Value root = readPropertyListFile(platform_.files(), kKXSnapshotPath, error, read);
+  const DataPtr bytes = readPropertyListBytes(platform_.files(), kKXSnapshotPath, error);
+  if (bytes) {
+    // What another decoder than ours makes of equal bytes may be something else.
+    *previous = std::async(std::launch::async, [this, own = decoder == own ? bytes : nullptr] {
+      return readPreviousSnapshot(own);
+    });
+  }
+  const Value root = bytes ? readPropertyList(bytes, error) : Value();
   const std::string agentPath = platform_.photoLibrary().syncInfoPath();
   removeSyncUserAgentInfoFile(agentPath);
   if (!root.isDictionary()) return nullptr;
@@ -105,26 +112,40 @@ void KXSyncClient::removeSyncUserAgentInfoFile(const std::string& path) {
          "Failed to remove syncUserAgentInfoFile at path %@ err: %@", path, error);
 }
 
-// Whether the snapshot of the last completed sync equals the new one, and the identifier of its
-// library. Whatever is wrong with that file, it only means that there is no previous snapshot. When
-// its bytes are those of the new one it is not decoded.
-bool KXSyncClient::equalsPreviousSnapshot(const KXSLibraryChangeSnapshot& snapshot,
-                                          const DataPtr& bytes,
-                                          std::optional<std::string>* libraryUUID) {
+// The snapshot of the last completed sync. Whatever is wrong with its file, it only means that
+// there is none. When its bytes are those given, of the new one, it is not decoded.
+KXSyncClient::PreviousSnapshot KXSyncClient::readPreviousSnapshot(const DataPtr& bytes) {
   FileSystem& files = platform_.files();
+  PreviousSnapshot previous;
   if (bytes && files.fileHolds(KXPreviousMetadataSyncFilePath, bytes->span())) {
+    previous.isTwin = true;
+    return previous;
+  }
+  const DataPtr last = files.readFile(KXPreviousMetadataSyncFilePath, nullptr);
+  const Value root = last ? readPropertyList(last, nullptr) : Value();
+  if (!root.isDictionary()) return previous;
+  try {
+    previous.snapshot =
+        KXSTransportDecoder::decoder()->decodeSnapshotFromPropertyList(root, nullptr);
+  } catch (const std::exception&) {
+    previous.snapshot = nullptr;
+  }
+  return previous;
+}
+
+// Whether the snapshot equals the one of the last completed sync, and the identifier of the
+// latter's library.
+bool KXSyncClient::equalsPreviousSnapshot(const KXSLibraryChangeSnapshot& snapshot,
+                                          const PreviousSnapshot& previous,
+                                          std::optional<std::string>* libraryUUID) {
+  if (previous.isTwin) {
     *libraryUUID = snapshot.libraryUUID();
     return snapshot.isEqualToTwin();
   }
-  const DataPtr last = files.readFile(KXPreviousMetadataSyncFilePath, nullptr);
-  if (!last) return false;
-  const Value root = readPropertyList(last, nullptr);
-  if (!root.isDictionary()) return false;
+  if (!previous.snapshot) return false;
   try {
-    const KXSLibraryChangeSnapshotPtr previous =
-        KXSTransportDecoder::decoder()->decodeSnapshotFromPropertyList(root, nullptr);
-    *libraryUUID = previous->libraryUUID();
-    return snapshot.isEqualToSnapshot(previous);
+    *libraryUUID = previous.snapshot->libraryUUID();
+    return snapshot.isEqualToSnapshot(previous.snapshot);
   } catch (const std::exception&) {
     return false;
   }

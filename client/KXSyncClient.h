@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <future>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -12,6 +13,7 @@
 #include "client/BlockFailure.h"
 #include "client/ContainerIndex.h"
 #include "client/KXSyncAssetGroup.h"
+#include "client/Memberships.h"
 #include "client/TransferList.h"
 #include "platform/Platform.h"
 #include "platform/foundation/OrderedMap.h"
@@ -180,10 +182,16 @@ class KXSyncClient final : public FRClient {
   void assertNotOnMainThread() const;
 
   // Reconcile driver.
-  KXSLibraryChangeSnapshotPtr decodeNewSnapshot(DataPtr* bytes, ErrorPtr* error,
-                                                ErrorPtr* decoderError);
+  struct PreviousSnapshot {
+    KXSLibraryChangeSnapshotPtr snapshot;  // null when there is none
+    bool isTwin = false;                   // not decoded: its bytes are the new one's
+  };
+  KXSLibraryChangeSnapshotPtr decodeNewSnapshot(std::future<PreviousSnapshot>* previous,
+                                                ErrorPtr* error, ErrorPtr* decoderError);
   void removeSyncUserAgentInfoFile(const std::string& path);
-  bool equalsPreviousSnapshot(const KXSLibraryChangeSnapshot& snapshot, const DataPtr& bytes,
+  PreviousSnapshot readPreviousSnapshot(const DataPtr& bytes);
+  bool equalsPreviousSnapshot(const KXSLibraryChangeSnapshot& snapshot,
+                              const PreviousSnapshot& previous,
                               std::optional<std::string>* libraryUUID);
   bool decideResync(OptionalString previousUUID, const KXSLibraryChangeSnapshot& snapshot);
   void reconcileSnapshot(const KXSLibraryChangeSnapshotPtr& snapshot, bool isResync);
@@ -203,8 +211,8 @@ class KXSyncClient final : public FRClient {
   void requestNewAssets(AssetReconciliation& run);
   void updateAssets(AssetReconciliation& run);
   bool deleteAssetIfStale(AssetReconciliation& run, std::string_view uuid, const KXSAsset& host,
-                          const KXManagedAssetPtr& device);
-  void updateSortToken(KXManagedAsset& device, std::string_view uuid);
+                          const KXManagedAssetPtr& present);
+  void updateSortToken(AssetReconciliation& run, KXManagedAsset& device, std::string_view uuid);
   void updateLocation(KXManagedAsset& device, const KXSAsset& host);
   void updateFaces(KXManagedAsset& device, const KXSAsset& host);
   void updateAlbums(AssetReconciliation& run, std::size_t index, std::string_view uuid,
@@ -213,6 +221,7 @@ class KXSyncClient final : public FRClient {
 
   // Album reconciliation.
   void reconcileAlbumsInTransaction();
+  static std::vector<std::uint8_t> assetOrderBytes(const KXSItemMapPtr& albumsAndEvents);
   static DeviceAlbumMap onDeviceAlbumsByUUID(KXPhotoLibrary& library);
   std::vector<Value> deleteAlbums(DeviceAlbumMap& onDevice);
   bool deleteAlbum(DeviceAlbumMap& onDevice, std::string_view uuid);
@@ -261,7 +270,9 @@ class KXSyncClient final : public FRClient {
   std::optional<OrderedMap<double>> sortTokens_;      // assetUUIDtoSortToken
   KXSLibraryChangeSnapshotPtr snapshot_;              // libraryChangeSnapshot
   std::optional<OrderedMap<unsigned>> pendingAssetsPerContainer_;
-  std::shared_ptr<AssetGroupMap> restoreGroups_;  // restorePathToAssetGroup
+  std::future<std::vector<std::uint8_t>> assetOrder_;  // for the coming album reconciliation
+  std::future<Memberships> hostMemberships_;           // for the coming asset reconciliation
+  std::shared_ptr<AssetGroupMap> restoreGroups_;       // restorePathToAssetGroup
   std::optional<Dictionary> restoreContext_;
   bool syncRequested_ = false;
   std::optional<ContainerIndex> containerIndex_;  // of albumsAndEvents_, made at the first import

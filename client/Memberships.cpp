@@ -17,9 +17,9 @@ std::uint32_t Memberships::numberOf(std::string_view key) {
   return numberOf(Value::string(key));
 }
 
-std::vector<Memberships::Membership> Memberships::membershipsIn(
-    const KXSItemMap& albumsAndEvents, const OrderedMap<std::uint32_t>& pairsByUUID) {
+Memberships::Memberships(const KXSAssetMap& hostAssets, const KXSItemMap& albumsAndEvents) {
   std::vector<Membership> found;
+  KXSAssetMap::Cursor cursor;
   for (const auto& entry : albumsAndEvents) {
     const auto* album = dynamic_cast<const KXSAlbum*>(entry.value.get());
     if (album == nullptr) continue;
@@ -27,41 +27,37 @@ std::vector<Memberships::Membership> Memberships::membershipsIn(
     if (!uuids) continue;
     const std::uint32_t number = numberOf(entry.key);
     for (std::size_t i = 0; i < uuids->size(); ++i) {
-      const std::uint32_t* pair = pairsByUUID.find(*uuids->stringAt(i, kKXSAlbumAssetUUIDsKey));
-      if (pair != nullptr) found.push_back({*pair, number});
+      if (hostAssets.find(*uuids->stringAt(i, kKXSAlbumAssetUUIDsKey), cursor) == nullptr) continue;
+      found.push_back({static_cast<std::uint32_t>(cursor.place()), number});
     }
   }
-  return found;
-}
-
-void Memberships::build(const std::vector<AssetPair>& pairs, const KXSItemMap* albumsAndEvents) {
-  OrderedMap<std::uint32_t> pairsByUUID;
-  pairsByUUID.reserve(pairs.size());
-  events_.assign(pairs.size(), kNone);
-  for (std::size_t i = 0; i < pairs.size(); ++i) {
-    pairsByUUID.set(pairs[i].uuid, static_cast<std::uint32_t>(i));
-    const OptionalString event = pairs[i].host->eventUUID();
-    if (event && !event->empty()) events_[i] = numberOf(*event);
-  }
-  std::vector<Membership> found;
-  if (albumsAndEvents != nullptr) found = membershipsIn(*albumsAndEvents, pairsByUUID);
-
-  starts_.assign(pairs.size() + 1, 0);
-  for (const Membership& membership : found) ++starts_[membership.pair + 1];
+  starts_.assign(hostAssets.places() + 1, 0);
+  for (const Membership& membership : found) ++starts_[membership.place + 1];
   for (std::size_t i = 1; i < starts_.size(); ++i) starts_[i] += starts_[i - 1];
-  std::vector<std::size_t> next = starts_;
+  std::vector<std::uint32_t> next = starts_;
   albums_.resize(found.size());
-  for (const Membership& membership : found) albums_[next[membership.pair]++] = membership.album;
+  for (const Membership& membership : found) albums_[next[membership.place]++] = membership.album;
 }
 
-const MembershipChanges& Memberships::changesFor(std::size_t index,
+void Memberships::setPairs(const std::vector<AssetPair>& pairs) {
+  pairs_.clear();
+  pairs_.reserve(pairs.size());
+  for (const AssetPair& pair : pairs) {
+    const OptionalString event = pair.host->value->eventUUID();
+    pairs_.emplace_back(static_cast<std::uint32_t>(pair.place),
+                        event && !event->empty() ? numberOf(*event) : kNone);
+  }
+}
+
+const MembershipChanges& Memberships::changesFor(std::size_t pair,
                                                  std::span<const KXGenericAlbumPtr> onDevice) {
   ++round_;
   changes_.toLeave.clear();
   changes_.toJoin.clear();
-  const std::span<const std::uint32_t> albums(albums_.data() + starts_[index],
-                                              starts_[index + 1] - starts_[index]);
-  if (events_[index] != kNone) atHost_[events_[index]] = round_;
+  const auto [place, event] = pairs_[pair];
+  const std::span<const std::uint32_t> albums(albums_.data() + starts_[place],
+                                              starts_[place + 1] - starts_[place]);
+  if (event != kNone) atHost_[event] = round_;
   for (const std::uint32_t album : albums) atHost_[album] = round_;
 
   for (const KXGenericAlbumPtr& album : onDevice) {
@@ -78,7 +74,7 @@ const MembershipChanges& Memberships::changesFor(std::size_t index,
     onDevice_[number] = round_;
     changes_.toJoin.push_back(keys_[number]);
   };
-  if (events_[index] != kNone) join(events_[index]);
+  if (event != kNone) join(event);
   for (const std::uint32_t album : albums) join(album);
   return changes_;
 }

@@ -4,6 +4,7 @@
 #include <cstdint>
 #include <span>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 #include "platform/foundation/OrderedMap.h"
@@ -12,11 +13,12 @@
 
 namespace kx {
 
-// One synced asset that host and device both have.
+// One synced asset that host and device both have: the device's, in a map that outlives this, and
+// the host's with its place in the map of the host's assets.
 struct AssetPair {
-  Value uuid;
-  KXManagedAssetPtr device;
-  const KXSAsset* host = nullptr;
+  const KXManagedAssetPtr* device = nullptr;
+  const KXSAssetMap::Entry* host = nullptr;
+  std::size_t place = 0;
 };
 
 // The containers that one asset must leave and join, by key.
@@ -25,34 +27,34 @@ struct MembershipChanges {
   std::vector<Value> toJoin;
 };
 
-// Which containers hold each of a run of assets at the host, and how that differs from the device.
-// Constant time per asset and membership. Used on one thread.
+// Which containers hold each asset of the host, and how that differs from the device. Constant time
+// per asset and membership. Used on one thread after the other.
 class Memberships {
  public:
-  // `albumsAndEvents` may be null. An asset's event counts as a container, known or not, unless its
-  // identifier is empty. Raises TypeError for an album whose list is none of texts.
-  void build(const std::vector<AssetPair>& pairs, const KXSItemMap* albumsAndEvents);
-  // For the pair at `index`, whose device albums are `onDevice`. The result is good until the next
+  // In the host's albums. Raises TypeError for an album whose list is none of texts.
+  Memberships(const KXSAssetMap& hostAssets, const KXSItemMap& albumsAndEvents);
+  // An asset's event counts as a container, known or not, unless its identifier is empty.
+  void setPairs(const std::vector<AssetPair>& pairs);
+  // For one of these pairs, whose device albums are `onDevice`. The result is good until the next
   // call.
-  const MembershipChanges& changesFor(std::size_t index,
+  const MembershipChanges& changesFor(std::size_t pair,
                                       std::span<const KXGenericAlbumPtr> onDevice);
 
  private:
   static constexpr std::uint32_t kNone = 0xFFFFFFFF;
   struct Membership {
-    std::uint32_t pair;
+    std::uint32_t place;
     std::uint32_t album;
   };
 
-  std::vector<Membership> membershipsIn(const KXSItemMap& albumsAndEvents,
-                                        const OrderedMap<std::uint32_t>& pairsByUUID);
   std::uint32_t numberOf(const Value& key);
   std::uint32_t numberOf(std::string_view key);
 
   OrderedMap<std::uint32_t> numbers_;  // container key to its number
   std::vector<Value> keys_;            // by number
-  std::vector<std::uint32_t> events_;  // by pair: its event's number or kNone
-  std::vector<std::size_t> starts_;    // by pair: where its albums start in albums_
+  // By pair: its place in the map of the host's assets, and its event's number or kNone.
+  std::vector<std::pair<std::uint32_t, std::uint32_t>> pairs_;
+  std::vector<std::uint32_t> starts_;  // by place: where its albums start in albums_
   std::vector<std::uint32_t> albums_;  // album numbers, in the order of the containers
   std::vector<std::size_t> atHost_;    // by number: the round that last found it there
   std::vector<std::size_t> onDevice_;

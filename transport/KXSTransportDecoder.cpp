@@ -147,14 +147,16 @@ ErrorPtr readFailure(const ErrorPtr& cause) {
 
 }  // namespace
 
-Value readPropertyListFile(FileSystem& files, const std::string& path, ErrorPtr* error,
-                           DataPtr* read) {
+DataPtr readPropertyListBytes(FileSystem& files, const std::string& path, ErrorPtr* error) {
   ErrorPtr cause;
   DataPtr bytes = files.readFile(path, &cause);
-  if (read != nullptr) *read = bytes;
-  if (bytes) return readPropertyList(std::move(bytes), error);
-  setError(error, readFailure(cause));
-  return Value();
+  if (!bytes) setError(error, readFailure(cause));
+  return bytes;
+}
+
+Value readPropertyListFile(FileSystem& files, const std::string& path, ErrorPtr* error) {
+  DataPtr bytes = readPropertyListBytes(files, path, error);
+  return bytes ? readPropertyList(std::move(bytes), error) : Value();
 }
 
 KXSLibraryChangeSnapshotPtr KXSTransportDecoder::decodeSnapshotFromFile(FileSystem& files,

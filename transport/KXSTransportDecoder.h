@@ -22,9 +22,10 @@ class UnknownObjectType : public InternalInconsistency {
 };
 
 // The property list in a device file; null and the reader's error when there is none. A file that
-// cannot be read is PropertyListError::kIo. `read`, when given, gets the bytes of the file.
-Value readPropertyListFile(FileSystem& files, const std::string& path, ErrorPtr* error,
-                           DataPtr* read = nullptr);
+// cannot be read is PropertyListError::kIo.
+Value readPropertyListFile(FileSystem& files, const std::string& path, ErrorPtr* error);
+// Its bytes alone.
+DataPtr readPropertyListBytes(FileSystem& files, const std::string& path, ErrorPtr* error);
 
 // Reads snapshot files. No state; any thread. Results are never null: an unreadable file gives a
 // snapshot without identifier and kind, and the reader's error. Raises InternalInconsistency for an
