@@ -45,28 +45,6 @@ bool before(const WholeMember& a, const WholeMember& b,
   return keyA != keyB ? keyA < keyB : a.uuid < b.uuid;
 }
 
-// Whether the members stand in the order all the same, whatever their positions.
-bool isInOrder(SqliteDatabase& database, RowId album, const AssetOrder::Album& order) {
-  std::vector<WholeMember> members;
-  {
-    SqliteStatement row(database,
-                        "SELECT a.uuid, a.sort_token, m.position FROM memberships m "
-                        "JOIN assets a ON a.pk = m.asset WHERE m.album = ?");
-    row.integer(album);
-    while (row.step()) {
-      members.push_back({row.textAt(0), row.optionalRealAt(1), row.optionalIntegerAt(2), {}});
-      members.back().wanted = order.indexOf(members.back().uuid);
-    }
-  }
-  std::sort(members.begin(), members.end(), [](const WholeMember& a, const WholeMember& b) {
-    return before(a, b, &WholeMember::stored);
-  });
-  return std::is_sorted(members.begin(), members.end(),
-                        [](const WholeMember& a, const WholeMember& b) {
-                          return before(a, b, &WholeMember::wanted);
-                        });
-}
-
 }  // namespace
 
 LibraryWriter::AlbumOrderState& LibraryWriter::orderState(RowId album) {
@@ -86,22 +64,46 @@ LibraryWriter::AlbumOrderState& LibraryWriter::orderState(RowId album) {
   return state;
 }
 
+template <typename Visit>
+void LibraryWriter::withAsset(RowId asset, const Visit& visit) {
+  if (const std::optional<AssetAtHand> known = atHand_ ? atHand_(asset) : std::nullopt) {
+    visit(known->uuid, known->sortToken);
+    return;
+  }
+  SqliteStatement row(database_, "SELECT uuid, sort_token FROM assets WHERE pk = ?");
+  row.integer(asset);
+  if (row.step()) visit(row.textViewAt(0), row.optionalRealAt(1));
+}
+
 std::vector<Member> LibraryWriter::membersOf(RowId album, const AssetOrder::Album& order) {
   std::vector<Member> members;
   SqliteStatement row(database_, "SELECT asset, position FROM memberships WHERE album = ?");
   row.integer(album);
   while (row.step()) {
     Member member{row.integerAt(0), std::nullopt, row.optionalIntegerAt(1)};
-    if (const OptionalString name = names_ ? names_(member.asset) : std::nullopt) {
-      member.index = order.indexOf(*name);
-    } else {
-      SqliteStatement asset(database_, "SELECT uuid FROM assets WHERE pk = ?");
-      asset.integer(member.asset);
-      if (asset.step()) member.index = order.indexOf(asset.textViewAt(0));
-    }
+    withAsset(member.asset, [&](std::string_view uuid, const std::optional<double>&) {
+      member.index = order.indexOf(uuid);
+    });
     members.push_back(member);
   }
   return members;
+}
+
+// Whether the members stand in the order all the same, whatever their positions.
+bool LibraryWriter::isInOrder(const std::vector<Member>& members) {
+  std::vector<WholeMember> whole;
+  whole.reserve(members.size());
+  for (const Member& member : members) {
+    withAsset(member.asset, [&](std::string_view uuid, const std::optional<double>& sortToken) {
+      whole.push_back({std::string(uuid), sortToken, member.stored, member.index});
+    });
+  }
+  std::sort(whole.begin(), whole.end(), [](const WholeMember& a, const WholeMember& b) {
+    return before(a, b, &WholeMember::stored);
+  });
+  return std::is_sorted(whole.begin(), whole.end(), [](const WholeMember& a, const WholeMember& b) {
+    return before(a, b, &WholeMember::wanted);
+  });
 }
 
 MemberPositions& LibraryWriter::learnPositions(RowId album, AlbumOrderState& state) {
@@ -205,7 +207,7 @@ void LibraryWriter::sortAlbum(RowId album) {
   MemberPositions positions;
   const std::vector<MemberPositions::Move> moves = positions.adopt(members);
   if (!moves.empty()) {
-    if (!sayTheOrder(members) && isInOrder(database_, album, *state.order)) return;
+    if (!sayTheOrder(members) && isInOrder(members)) return;
     writeMoves(album, moves);
     writeTag(album, state);
   }

@@ -39,9 +39,14 @@ class LibraryWriter {
   LibraryWriter(SqliteDatabase& database, AssetOrder& order, KnownAlbumPositions& positions)
       : database_(database), order_(order), knownPositions_(positions) {}
 
-  // Spares a look into the table for each asset whose identifier is at hand.
-  using Names = std::function<OptionalString(RowId asset)>;
-  void setNames(Names names) { names_ = std::move(names); }
+  // What the order inside an album depends on. Spares a look into the table for each asset of which
+  // it is at hand.
+  struct AssetAtHand {
+    std::string_view uuid;
+    std::optional<double> sortToken;
+  };
+  using AtHand = std::function<std::optional<AssetAtHand>(RowId asset)>;
+  void setAtHand(AtHand atHand) { atHand_ = std::move(atHand); }
 
   void insertAlbum(RowId pk, const AlbumRow& album, std::optional<ListId> list);
   void updateAlbum(RowId pk, const AlbumRow& before, const AlbumRow& after);
@@ -87,6 +92,10 @@ class LibraryWriter {
     MemberPositions* positions = nullptr;  // null: not read yet, or not those of `order`
   };
   AlbumOrderState& orderState(RowId album);
+  // Calls visit(uuid, sortToken); not for an asset that is not there.
+  template <typename Visit>
+  void withAsset(RowId asset, const Visit& visit);
+  bool isInOrder(const std::vector<MemberPositions::Member>& members);
   std::vector<MemberPositions::Member> membersOf(RowId album, const AssetOrder::Album& order);
   MemberPositions& learnPositions(RowId album, AlbumOrderState& state);
   void putInOrder(RowId album, AlbumOrderState& state);
@@ -105,7 +114,7 @@ class LibraryWriter {
   RowChanges rows_;
   LibraryChanges changes_;
   std::vector<std::string> releasedFiles_;
-  Names names_;
+  AtHand atHand_;
 };
 
 }  // namespace kx
