@@ -3,7 +3,7 @@
 namespace kx::cli {
 
 DataPtr LibraryLink::snapshot(ErrorPtr* error) {
-  DataPtr bytes = library_.snapshotBytes();
+  DataPtr bytes = library_.takeSnapshotBytes();
   if (!bytes) {
     setError(error, Error::make(kHostErrorDomain, static_cast<std::int64_t>(HostError::kUnreadable),
                                 "no snapshot in " + library_.path()));

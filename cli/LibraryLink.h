@@ -8,18 +8,20 @@
 
 namespace kx::cli {
 
-// The sync link to a host library that lies in this machine's file system. One thread.
+// The sync link to a host library that lies in this machine's file system, whose snapshot it takes.
+// One thread.
 class LibraryLink : public HostLink {
  public:
-  explicit LibraryLink(const HostLibrary& library) : library_(library) {}
+  explicit LibraryLink(HostLibrary& library) : library_(library) {}
 
   std::string description() const override { return library_.path(); }
   DataPtr snapshot(ErrorPtr* error) override;
+  void expectFiles() override { library_.expectMedia(); }
   std::optional<std::int64_t> mediaSize(std::string_view identifier) override;
   FileDescriptor openMedia(std::string_view identifier, ErrorPtr* error) override;
 
  private:
-  const HostLibrary& library_;
+  HostLibrary& library_;
 };
 
 }  // namespace kx::cli

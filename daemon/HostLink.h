@@ -24,6 +24,9 @@ class HostLink {
   // there are none. More than limits::kSnapshotFileBytes need not be read: that is an error, too.
   virtual DataPtr snapshot(ErrorPtr* error) = 0;
 
+  // A hint: files are going to be asked for. What finding them takes may be done meanwhile.
+  virtual void expectFiles() {}
+
   // Size of the asset's file in bytes where that is known without opening it; nullopt otherwise.
   virtual std::optional<std::int64_t> mediaSize(std::string_view identifier) = 0;
 

@@ -33,11 +33,25 @@ std::size_t countWithout(const std::set<std::string>& counted, const std::set<st
                     [&](const std::string& uuid) { return !left.contains(uuid); }));
 }
 
-// A hint from outside the device, which is not open yet: the sealed snapshot is as long.
-bool mayBeSealed(const Data& bytes, const std::string& deviceRoot) {
+// A hint from outside the device, which is not open yet.
+bool isSealed(const std::string& deviceRoot) {
   struct stat status;
-  return ::lstat((deviceRoot + KXPreviousMetadataSyncFilePath).c_str(), &status) == 0 &&
-         static_cast<std::uint64_t>(status.st_size) == bytes.span().size();
+  return ::lstat((deviceRoot + KXPreviousMetadataSyncFilePath).c_str(), &status) == 0;
+}
+
+// Null when the file is missing, malformed or names none.
+std::optional<std::string> libraryUUIDIn(FileSystem& files, const std::string& path) {
+  const Value uuid = readDevicePropertyList(files, path)["libraryUUID"];
+  if (!uuid.isString()) return std::nullopt;
+  return std::string(uuid.stringValue());
+}
+
+// Whether a sync of the sealed snapshot may turn out to be a null one, at a glance: assets without
+// a place never count as unchanged.
+bool mayBeNull(const Data& sealed) {
+  const std::span<const std::uint8_t> bytes = sealed.span();
+  const std::string_view text(reinterpret_cast<const char*>(bytes.data()), bytes.size());
+  return text.find("latitude") != std::string_view::npos;
 }
 
 }  // namespace
@@ -55,7 +69,8 @@ std::optional<HostSnapshot> readHostSnapshot(HostLink& host, const std::string& 
     setError(error, problem);
     return std::nullopt;
   }
-  if (mayBeSealed(*snapshot.bytes, deviceRoot)) return snapshot;
+  // It is checked when it is known not to be the sealed one, while the library is read ahead.
+  if (isSealed(deviceRoot)) return snapshot;
   snapshot.checked = checkSnapshot(snapshot.bytes, error);
   if (!snapshot.checked) return std::nullopt;
   return snapshot;
@@ -112,7 +127,16 @@ bool SyncSession::matchesSeal() {
   return *matchesSeal_;
 }
 
+// What a sync that is no null one needs later on.
+void SyncSession::readMeanwhile() {
+  context_.host.expectFiles();
+  sealedLibraryUUID_ = std::async(
+      std::launch::async, [this] { return libraryUUIDIn(files_, KXPreviousMetadataSyncFilePath); });
+}
+
 bool SyncSession::checkBeforeFirstEffect() {
+  if (!matchesSeal() || !mayBeNull(*snapshot_.bytes)) context_.device.readAhead();
+  if (!matchesSeal()) readMeanwhile();
   // These very bytes have been checked and synced whole: everything unlisted is gone since, and
   // everything listed is there.
   ErrorPtr error = matchesSeal() ? nullptr : checkAgainstDevice();
@@ -139,6 +163,9 @@ bool SyncSession::putSnapshotInPlace() {
   if (staging_) staging_->clear();
   // A file that holds these bytes already is left as it is.
   if (!error) files_.writeFileAtomically(kKXSnapshotPath, snapshot_.bytes->span(), &error);
+  // It has served, and of a large library it is a good part of our memory.
+  if (snapshot_.checked) libraryUUID_ = std::move(snapshot_.checked->libraryUUID);
+  snapshot_ = {};
   if (error) fail(prefixed("the snapshot cannot be put on the device", *error));
   return error == nullptr;
 }
@@ -175,8 +202,7 @@ bool SyncSession::reconcile() {
   const bool isResync = predictResync();
   const bool hadLastSynced = files_.fileExists(KXPreviousMetadataSyncFilePath);
   // What is sealed belongs to the library that the device knows already.
-  const ErrorPtr kept =
-      matchesSeal() ? nullptr : librarySwitch_.begin(snapshot_.checked->libraryUUID);
+  const ErrorPtr kept = matchesSeal() ? nullptr : librarySwitch_.begin(libraryUUID_);
   if (kept) {
     fail(prefixed("the name of the library before cannot be kept", *kept));
     endWithoutTransfers();
@@ -184,6 +210,7 @@ bool SyncSession::reconcile() {
   }
   ErrorPtr error;
   const bool reconciled = callReconcile(&error);
+  context_.device.stopReadingAhead();
   settleLibrarySwitch(reconciled);
   if (!reconciled) {
     failCall(SyncErrorCode::kReconcile, "reconciling failed", error);
@@ -215,15 +242,12 @@ void SyncSession::settleLibrarySwitch(bool reconciled) {
 // By the rules of the reconcile, over the same files, before it changes them.
 bool SyncSession::predictResync() {
   if (matchesSeal()) return false;
-  Value known = readDevicePropertyList(files_, KXPreviousMetadataSyncFilePath)["libraryUUID"];
-  if (!known.isString()) {
-    known = readDevicePropertyList(files_, kKXCurrentLibraryUUIDPath)["libraryUUID"];
-  }
-  return !known.isString() || known.stringValue() != snapshot_.checked->libraryUUID;
+  std::optional<std::string> known = sealedLibraryUUID_.get();
+  if (!known) known = libraryUUIDIn(files_, kKXCurrentLibraryUUIDPath);
+  return known != libraryUUID_;
 }
 
 void SyncSession::transferAndEnd() {
-  snapshot_ = {};  // it has served, and of a large library it is a good part of our memory
   enter(context_.plan ? SyncPhase::kPlanning : SyncPhase::kTransferring);
   const bool allArrived = transfer();
   enter(SyncPhase::kFinishing);
@@ -315,6 +339,7 @@ void SyncSession::endWithoutTransfers() {
 }
 
 void SyncSession::conclude() {
+  context_.device.stopReadingAhead();
   if (plugin_) {
     if (const auto raised = plugin_->destroyClient()) {
       fail(syncError(SyncErrorCode::kPlugin,

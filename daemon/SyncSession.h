@@ -1,5 +1,6 @@
 #pragma once
 
+#include <future>
 #include <memory>
 #include <optional>
 #include <set>
@@ -43,6 +44,7 @@ class SyncSession {
  private:
   // The phases; false ends the run with what `result_` says by then.
   bool checkBeforeFirstEffect();
+  void readMeanwhile();
   bool putSnapshotInPlace();
   bool prepare();
   bool reconcile();
@@ -69,7 +71,8 @@ class SyncSession {
   void failCall(SyncErrorCode code, const std::string& call, const ErrorPtr& error);
 
   Context context_;
-  HostSnapshot snapshot_;  // up to the end of the reconcile
+  HostSnapshot snapshot_;    // until it is in place
+  std::string libraryUUID_;  // of a snapshot that was not sealed
   std::optional<bool> matchesSeal_;
   FileSystem& files_;
   LibrarySwitch librarySwitch_;
@@ -78,6 +81,7 @@ class SyncSession {
   SyncResult result_;
   std::set<std::string> requested_;  // identifiers of the sync requests
   double startedAt_;
+  std::future<std::optional<std::string>> sealedLibraryUUID_;
   bool isNull_ = false;
   bool cancelled_ = false;
   bool diskFull_ = false;

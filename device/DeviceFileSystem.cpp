@@ -93,7 +93,9 @@ bool DeviceFileSystem::writeFileAtomically(const std::string& path,
 }
 
 bool DeviceFileSystem::removeItem(const std::string& path, ErrorPtr* error) {
-  return done(path, readOnly_ ? EROFS : root_->remove(path), error);
+  if (!done(path, readOnly_ ? EROFS : root_->remove(path), error)) return false;
+  if (onRemoved_) onRemoved_(path);
+  return true;
 }
 
 bool DeviceFileSystem::createDirectoryWithIntermediates(const std::string& path, ErrorPtr* error) {

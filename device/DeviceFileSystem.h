@@ -1,5 +1,6 @@
 #pragma once
 
+#include <functional>
 #include <memory>
 #include <string>
 #include <vector>
@@ -15,6 +16,12 @@ class DeviceFileSystem : public FileSystem {
  public:
   DeviceFileSystem(std::shared_ptr<DeviceRoot> root, bool readOnly)
       : root_(std::move(root)), readOnly_(readOnly) {}
+
+  // Called with the path of each item that removeItem has removed, on its thread. Set it while
+  // nobody else uses the files.
+  void setOnRemoved(std::function<void(const std::string&)> onRemoved) {
+    onRemoved_ = std::move(onRemoved);
+  }
 
   bool fileExists(const std::string& path) override;
   DataPtr readFile(const std::string& path, ErrorPtr* error) override;
@@ -35,6 +42,7 @@ class DeviceFileSystem : public FileSystem {
 
   const std::shared_ptr<DeviceRoot> root_;
   const bool readOnly_;
+  std::function<void(const std::string&)> onRemoved_;
 };
 
 }  // namespace kx

@@ -13,8 +13,11 @@ constexpr std::int32_t kUserAlbumKind = 2;
 
 DeviceLibrary::~DeviceLibrary() {
   // Its context belongs to the queue, whoever lets go of the library last.
-  if (context_)
-    store_->queue().async([context = std::move(context_)]() mutable { context.reset(); });
+  if (!context_) return;
+  store_->queue().async([context = std::move(context_), readAhead = readAhead_]() mutable {
+    readAhead->giveBack(std::move(context));
+    context.reset();
+  });
 }
 
 void DeviceLibrary::submit(const DispatchGroupPtr& group, Block block, Running how) {
@@ -36,12 +39,16 @@ void DeviceLibrary::performBlock(Block block) {
 }
 
 void DeviceLibrary::run(const Block& block, Running how) {
+  if (!context_) context_ = readAhead_->take();
   if (!context_) context_ = std::make_shared<LibraryContext>(store_);
   running_ = how;
+  store_->beginReading();
   try {
     block();
+    store_->endReading();
     if (how == Running::kTransaction) context_->save();
   } catch (const std::exception& exception) {
+    store_->endReading();
     context_->dropChanges();
     store_->health().noteFailure(
         how == Running::kTransaction ? "a library transaction ended with an exception"
@@ -122,7 +129,7 @@ std::shared_ptr<KXManagedAlbumList> DeviceLibrary::facesAlbumList() {
 std::string DeviceLibrary::description() const { return "KXPhotoLibrary"; }
 
 KXPhotoLibraryPtr DeviceLibraryFramework::newPhotoLibrary() {
-  return std::make_shared<DeviceLibrary>(store_);
+  return std::make_shared<DeviceLibrary>(store_, readAhead_);
 }
 
 std::string DeviceLibraryFramework::dcimDirectory() { return device_paths::kDcim; }

@@ -7,6 +7,7 @@
 
 #include "device/LibraryContext.h"
 #include "device/LibraryStore.h"
+#include "device/ReadAhead.h"
 #include "platform/library/KXPhotoLibrary.h"
 
 namespace kx {
@@ -14,7 +15,8 @@ namespace kx {
 // The reference device's photo library as one of its users sees it.
 class DeviceLibrary : public KXPhotoLibrary {
  public:
-  explicit DeviceLibrary(std::shared_ptr<LibraryStore> store) : store_(std::move(store)) {}
+  DeviceLibrary(std::shared_ptr<LibraryStore> store, std::shared_ptr<ReadAhead> readAhead)
+      : store_(std::move(store)), readAhead_(std::move(readAhead)) {}
   ~DeviceLibrary() override;
 
   void withDispatchGroupPerformTransaction(const DispatchGroupPtr& group, Block block) override;
@@ -46,14 +48,16 @@ class DeviceLibrary : public KXPhotoLibrary {
   LibraryContext& contextOfTransaction();
 
   const std::shared_ptr<LibraryStore> store_;
-  std::shared_ptr<LibraryContext> context_;  // made by the first block
+  const std::shared_ptr<ReadAhead> readAhead_;
+  std::shared_ptr<LibraryContext> context_;  // had by the first block
   Running running_ = Running::kNothing;
 };
 
 // The class operations of the library framework.
 class DeviceLibraryFramework : public KXPhotoLibraryFramework {
  public:
-  explicit DeviceLibraryFramework(std::shared_ptr<LibraryStore> store) : store_(std::move(store)) {}
+  DeviceLibraryFramework(std::shared_ptr<LibraryStore> store, std::shared_ptr<ReadAhead> readAhead)
+      : store_(std::move(store)), readAhead_(std::move(readAhead)) {}
   KXPhotoLibraryPtr newPhotoLibrary() override;
   std::string dcimDirectory() override;
   std::string photoDataDirectory() override;
@@ -67,6 +71,7 @@ class DeviceLibraryFramework : public KXPhotoLibraryFramework {
 
  private:
   const std::shared_ptr<LibraryStore> store_;
+  const std::shared_ptr<ReadAhead> readAhead_;
 };
 
 }  // namespace kx

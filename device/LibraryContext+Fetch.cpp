@@ -55,11 +55,46 @@ std::optional<std::vector<KXManagedAssetPtr>> LibraryContext::fetchAssets(
   using Assets = std::vector<KXManagedAssetPtr>;
   return fetched<Assets>(*store_, error, [&] {
     Assets assets;
-    readAssets(request.predicate, &assets);
-    if (request.prefetchFaces) prefetchFaces(assets);
-    if (request.prefetchAlbums) prefetchAlbums(assets);
+    const bool isAtHand = isReadAhead(request.predicate);
+    if (isAtHand) {
+      assets = ahead_->assets;
+    } else {
+      readAssets(request.predicate, &assets);
+    }
+    if (request.prefetchFaces && !isAtHand) prefetchFaces(assets);
+    if (request.prefetchAlbums && !(isAtHand && ahead_->albumsEpoch == albumsEpoch_)) {
+      prefetchAlbums(assets);
+    }
     return assets;
   });
+}
+
+void LibraryContext::readAhead(const std::atomic<bool>& wanted) {
+  wanted_ = &wanted;
+  try {
+    Ahead ahead;
+    readAssets({}, &ahead.assets);
+    prefetchFaces(ahead.assets);
+    prefetchAlbums(ahead.assets);
+    ahead.changes = store_->assetChanges();
+    ahead.albumsEpoch = albumsEpoch_;
+    if (wanted) ahead_ = std::move(ahead);
+  } catch (const SqliteError&) {
+    // Whoever needs the rows asks again, and tells of the failure.
+  }
+  wanted_ = nullptr;
+}
+
+bool LibraryContext::isReadAhead(const AssetPredicate& predicate) const {
+  const AssetPredicate synced;
+  return ahead_ && ahead_->changes == store_->assetChanges() && changedAssets_.empty() &&
+         changedFaces_.empty() && memberships_.empty() &&
+         predicate.comparison == synced.comparison &&
+         predicate.savedAssetType == synced.savedAssetType;
+}
+
+bool LibraryContext::nextRow(SqliteStatement& row) {
+  return (wanted_ == nullptr || wanted_->load(std::memory_order_relaxed)) && row.step();
 }
 
 void LibraryContext::readAssets(const AssetPredicate& predicate,
@@ -73,7 +108,7 @@ void LibraryContext::readAssets(const AssetPredicate& predicate,
             "latitude, longitude FROM assets WHERE +saved_type <> ? ORDER BY pk";
   SqliteStatement row(store_->database(), sql);
   row.integer(predicate.savedAssetType);
-  while (row.step()) {
+  while (nextRow(row)) {
     std::shared_ptr<StoredAsset> object = asset(row.integerAt(0));
     if (!object->loaded_) object->load(readAssetRow(row, 1));
     if (!object->isDeleted() && matches(predicate, object->savedAssetType())) {
@@ -97,13 +132,13 @@ void LibraryContext::prefetchFaces(const std::vector<KXManagedAssetPtr>& assets)
   SqliteStatement row(store_->database(),
                       "SELECT asset, pk, identifier, x, y, width, height, album_uuid FROM faces "
                       "ORDER BY asset, pk");
-  bool more = row.step();
+  bool more = nextRow(row);
   for (const KXManagedAssetPtr& object : assets) {
     StoredAsset& owner = static_cast<StoredAsset&>(*object);
-    while (more && row.integerAt(0) < owner.pk_) more = row.step();
+    while (more && row.integerAt(0) < owner.pk_) more = nextRow(row);
     if (owner.facesRead_ || owner.relationsChanged_) continue;
     std::vector<KXManagedFacePtr> found;
-    for (; more && row.integerAt(0) == owner.pk_; more = row.step()) {
+    for (; more && row.integerAt(0) == owner.pk_; more = nextRow(row)) {
       std::shared_ptr<StoredFace> shown = face(row.integerAt(1), owner.pk_);
       if (!shown->loaded_) shown->load(readFaceRow(row, 2));
       found.push_back(std::move(shown));
@@ -122,13 +157,13 @@ void LibraryContext::prefetchAlbums(const std::vector<KXManagedAssetPtr>& assets
   }
   SqliteStatement row(store_->database(),
                       "SELECT asset, album FROM memberships ORDER BY asset, album");
-  bool more = row.step();
+  bool more = nextRow(row);
   for (const KXManagedAssetPtr& object : assets) {
     StoredAsset& owner = static_cast<StoredAsset&>(*object);
-    while (more && row.integerAt(0) < owner.pk_) more = row.step();
+    while (more && row.integerAt(0) < owner.pk_) more = nextRow(row);
     if (owner.relationsChanged_) continue;
     owner.albums_.clear();
-    for (; more && row.integerAt(0) == owner.pk_; more = row.step()) {
+    for (; more && row.integerAt(0) == owner.pk_; more = nextRow(row)) {
       const std::shared_ptr<StoredAlbum>& holder = albums_.at(row.integerAt(1));
       if (!holder->isDeleted()) owner.albums_.push_back(holder);
     }

@@ -134,16 +134,18 @@ ErrorPtr LibraryContext::save() {
   return failure;
 }
 
-OptionalString LibraryContext::nameAtHand(RowId pk) const {
+std::optional<LibraryWriter::AssetAtHand> LibraryContext::assetAtHand(RowId pk) const {
   const std::shared_ptr<StoredAsset> known = assets_.find(pk);
   if (!known || !known->loaded_ || known->isDeleted()) return std::nullopt;
-  return known->uuid();
+  const OptionalString uuid = known->uuid();
+  if (!uuid) return std::nullopt;
+  return LibraryWriter::AssetAtHand{*uuid, known->sortToken()};
 }
 
 void LibraryContext::flush(LibraryWriter& writer) {
   flushAlbums(writer);
   flushAssets(writer);
-  writer.setNames([this](RowId pk) { return nameAtHand(pk); });
+  writer.setAtHand([this](RowId pk) { return assetAtHand(pk); });
   flushMemberships(writer);
   for (const auto& [pk, album] : changedAlbums_) {
     if (album->life_ == StoredAlbum::Life::kDeleting && !album->insertedInto_) {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <atomic>
 #include <cstdint>
 #include <map>
 #include <memory>
@@ -40,6 +41,11 @@ class LibraryContext : public KXManagedObjectContext {
                                                                  ErrorPtr* error) override;
   std::vector<std::shared_ptr<KXManagedObject>> registeredObjects() override;
   void refreshObject(const std::shared_ptr<KXManagedObject>& object, bool mergeChanges) override;
+
+  // Reads the synced assets with faces and albums, so that a fetch of them finds all at hand as
+  // long as no transaction changes assets. Gives up when `wanted` becomes false; a failure is left
+  // to the fetch itself.
+  void readAhead(const std::atomic<bool>& wanted);
 
   // What KXPhotoLibrary's class operations need.
   KXGenericAlbumPtr albumWithRole(std::string_view role);
@@ -83,13 +89,23 @@ class LibraryContext : public KXManagedObjectContext {
  private:
   using Members = std::map<std::pair<RowId, RowId>, bool>;  // (asset, album)
 
+  // The synced assets, their faces and albums, as they were read ahead.
+  struct Ahead {
+    std::vector<KXManagedAssetPtr> assets;
+    std::uint64_t changes = 0;  // the store's assetChanges then
+    std::uint32_t albumsEpoch = 0;
+  };
+
+  bool isReadAhead(const AssetPredicate& predicate) const;
   void readAssets(const AssetPredicate& predicate, std::vector<KXManagedAssetPtr>* assets);
   void prefetchFaces(const std::vector<KXManagedAssetPtr>& assets);
   void prefetchAlbums(const std::vector<KXManagedAssetPtr>& assets);
+  // The next row of a long reading; none when the reading is not wanted any more.
+  bool nextRow(SqliteStatement& row);
   bool isEmptyNow(RowId album);
   void flush(LibraryWriter& writer);
-  // The identifier of an asset as a flush has written it, if it is at hand.
-  OptionalString nameAtHand(RowId pk) const;
+  // An asset as a flush has written it, if it is at hand.
+  std::optional<LibraryWriter::AssetAtHand> assetAtHand(RowId pk) const;
   void flushAlbums(LibraryWriter& writer);
   void flushAssets(LibraryWriter& writer);
   void flushMemberships(LibraryWriter& writer);
@@ -110,6 +126,8 @@ class LibraryContext : public KXManagedObjectContext {
   Members memberships_;
   std::shared_ptr<StoredAlbumList> lists_[kListCount];
   std::uint32_t albumsEpoch_ = 0;
+  std::optional<Ahead> ahead_;
+  const std::atomic<bool>* wanted_ = nullptr;  // of the reading ahead that is under way
 };
 
 }  // namespace kx

@@ -31,7 +31,29 @@ LibraryStore::LibraryStore(Parts parts)
 
 LibraryStore::~LibraryStore() = default;
 
+void LibraryStore::beginReading() {
+  if (parts_.planOnly || isReading_) return;
+  try {
+    database().execute("BEGIN");
+    isReading_ = true;
+  } catch (const SqliteError&) {
+  }
+}
+
+void LibraryStore::endReading() {
+  if (!std::exchange(isReading_, false)) return;
+  try {
+    database().execute("COMMIT");
+  } catch (const SqliteError&) {
+    try {
+      database().rollback();
+    } catch (const SqliteError&) {  // an error has ended it already
+    }
+  }
+}
+
 ErrorPtr LibraryStore::write(const Work& work, const LibraryContext* origin) {
+  endReading();
   ErrorPtr failure = broken_;
   if (parts_.readOnly) failure = systemError("cannot write", "the library", EROFS);
   if (!failure) {
@@ -80,6 +102,7 @@ void LibraryStore::published(LibraryWriter& writer, const LibraryContext* origin
     changes_.deletedContainers.merge(news.deletedContainers);
     changes_.renamedContainers.merge(news.renamedContainers);
   }
+  if (!writer.rows().assets.empty() || !writer.rows().deletedAssets.empty()) ++assetChanges_;
   for (LibraryContext* context : contexts_) {
     if (context != origin) context->refreshRows(writer.rows());
   }

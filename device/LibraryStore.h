@@ -43,6 +43,11 @@ class LibraryStore {
   HealthRecord& health() { return *parts_.health; }
   const DeviceLog& log() { return *parts_.log; }
 
+  // What is read until endReading, or the next write, takes the database's lock once instead of
+  // once a statement. Both only tune: a failure shows at the next statement.
+  void beginReading();
+  void endReading();
+
   using Work = std::function<void(LibraryWriter&)>;
   // One write transaction: all of the work or, with an error, nothing of it. A failure is noted in
   // the device's health. After the commit every open context but `origin` has been refreshed.
@@ -51,6 +56,9 @@ class LibraryStore {
   void setFileReleaser(std::function<void(std::vector<std::string>)> releaser) {
     releaser_ = std::move(releaser);
   }
+
+  // Grows with every transaction that has changed assets, their faces or memberships.
+  std::uint64_t assetChanges() const { return assetChanges_; }
 
   RowId newAlbumId() { return ++lastAlbum_; }
   RowId newFaceId() { return ++lastFace_; }
@@ -80,6 +88,8 @@ class LibraryStore {
   std::vector<LibraryContext*> contexts_;
   std::function<void(std::vector<std::string>)> releaser_;
   std::uint64_t listSorts_ = 0;
+  std::uint64_t assetChanges_ = 0;
+  bool isReading_ = false;
   DeviceCounters counted_;
   std::mutex changesMutex_;
   LibraryChanges changes_;

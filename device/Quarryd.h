@@ -22,6 +22,8 @@
 
 namespace kx {
 
+class SnapshotAssets;
+
 // The asset daemon: works the jobs it is handed one hand-over after the other on a thread of its
 // own; its transactions run on the library's queue, its completions on a third. Public operations
 // from any thread, they return at once.
@@ -42,6 +44,9 @@ class Quarryd {
   // Ends a restore that a marker tells of: completes what is there; with `recreateAlbums` it also
   // takes in the camera's files that the library does not know, and the albums of the backup.
   void finalizeRestore(bool recreateAlbums);
+  // A hint: the seal is gone, so that the snapshot in place will have to be proved again. What that
+  // takes of the snapshot is read meanwhile.
+  void expectSeal();
   // While a restore runs no sync is sealed.
   void setRestoring(bool restoring) { restoring_ = restoring; }
   // Files below the synced-assets directory that no row names any more.
@@ -73,6 +78,7 @@ class Quarryd {
   [[nodiscard]] ErrorPtr cleanUp(const HandOver& handOver, const std::optional<Date>& before);
   [[nodiscard]] ErrorPtr seal(const std::string& snapshotPath);
   [[nodiscard]] std::optional<std::string> whyNotWhole(const DataPtr& snapshot);
+  [[nodiscard]] std::optional<std::string> whyNotInLibrary(SnapshotAssets wanted);
 
   // Restores.
   [[nodiscard]] ErrorPtr completeAssets(const std::vector<std::string>& uuids);
@@ -88,7 +94,9 @@ class Quarryd {
   std::atomic<bool> leftFilesBehind_{false};
   std::atomic<bool> restoring_{false};
   std::mutex restoredMutex_;
-  std::vector<std::string> restored_;  // assets with new files that nobody has looked at yet
+  struct Expected;
+  std::shared_ptr<Expected> expected_;  // read ahead for the next seal; on the work queue
+  std::vector<std::string> restored_;   // assets with new files that nobody has looked at yet
   DispatchQueuePtr completions_;
   DispatchQueuePtr work_;  // last: its blocks use the rest
 };

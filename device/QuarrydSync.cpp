@@ -25,6 +25,13 @@ int errnoOf(bool done, const ErrorPtr& error) {
 
 }  // namespace
 
+// A snapshot with the assets that it lists. Texts are those of the root.
+struct Quarryd::Expected {
+  DataPtr bytes;
+  Value root;
+  SnapshotAssets assets;
+};
+
 ErrorPtr Quarryd::cleanUp(const HandOver& handOver, const std::optional<Date>& before) {
   // Directories come before what they hold; they are removed the other way round.
   std::vector<FileProperties> found;
@@ -53,10 +60,23 @@ ErrorPtr Quarryd::cleanUp(const HandOver& handOver, const std::optional<Date>& b
   return failure;
 }
 
+void Quarryd::expectSeal() {
+  work_->async([this] {
+    DataPtr bytes = files_.readFile(device_paths::kSnapshot, nullptr);
+    if (!bytes) return;
+    std::string ignored;
+    const Value root = readPropertyList(bytes, nullptr);
+    auto assets = root.isDictionary() ? SnapshotAssets::of(root, &ignored) : std::nullopt;
+    // What makes no sense is told of when the seal is asked for.
+    if (assets) expected_.reset(new Expected{std::move(bytes), root, std::move(*assets)});
+  });
+}
+
 std::optional<std::string> Quarryd::whyNotWhole(const DataPtr& snapshot) {
-  LibraryStore& store = *parts_.store;
+  const std::shared_ptr<Expected> expected = std::move(expected_);
   if (restoring_) return "a restore is under way";
-  if (store.health().anyFailure()) return "something failed since the sync began";
+  if (parts_.store->health().anyFailure()) return "something failed since the sync began";
+  if (expected && expected->bytes == snapshot) return whyNotInLibrary(std::move(expected->assets));
   ErrorPtr unreadable;
   const Value root = readPropertyList(snapshot, &unreadable);
   if (!root.isDictionary()) {
@@ -64,7 +84,11 @@ std::optional<std::string> Quarryd::whyNotWhole(const DataPtr& snapshot) {
   }
   std::string why;
   std::optional<SnapshotAssets> wanted = SnapshotAssets::of(root, &why);
-  if (!wanted) return why;
+  return wanted ? whyNotInLibrary(std::move(*wanted)) : why;
+}
+
+std::optional<std::string> Quarryd::whyNotInLibrary(SnapshotAssets wanted) {
+  LibraryStore& store = *parts_.store;
   std::optional<std::string> found;
   store.queue().sync([&] {
     try {
@@ -72,20 +96,21 @@ std::optional<std::string> Quarryd::whyNotWhole(const DataPtr& snapshot) {
                           "SELECT uuid, modification_date, incomplete FROM assets "
                           "WHERE +saved_type = 256");
       while (row.step()) {
-        SnapshotAssets::Asset* const expected = wanted->find(row.textViewAt(0));
+        const std::string_view uuid = row.textViewAt(0);
+        SnapshotAssets::Asset* const expected = wanted.find(uuid);
         if (expected == nullptr) continue;
         if (row.integerAt(2) != 0) {
-          found = std::string(expected->uuid) + " is incomplete";
+          found = std::string(uuid) + " is incomplete";
           return;
         }
         if (row.optionalRealAt(1) != std::optional<double>(expected->modified)) {
-          found = std::string(expected->uuid) + " has another modification date";
+          found = std::string(uuid) + " has another modification date";
           return;
         }
         expected->proved = true;
       }
-      if (const SnapshotAssets::Asset* missing = wanted->firstNotProved()) {
-        found = std::string(missing->uuid) + " is not in the library";
+      if (const OptionalString missing = wanted.firstNotProved()) {
+        found = std::string(*missing) + " is not in the library";
       }
     } catch (const SqliteError& error) {
       found = error.what();
@@ -97,7 +122,11 @@ std::optional<std::string> Quarryd::whyNotWhole(const DataPtr& snapshot) {
 ErrorPtr Quarryd::seal(const std::string& snapshotPath) {
   LibraryStore& store = *parts_.store;
   ErrorPtr error;
-  const DataPtr snapshot = files_.readFile(snapshotPath, &error);
+  // Bytes that were read ahead are the ones, while the file still holds them.
+  DataPtr snapshot = expected_ ? expected_->bytes : nullptr;
+  if (!snapshot || !files_.fileHolds(snapshotPath, snapshot->span())) {
+    snapshot = files_.readFile(snapshotPath, &error);
+  }
   if (!snapshot) {
     store.log().failure("the sync is not sealed",
                         systemError("cannot read", snapshotPath, errnoOf(false, error)));

@@ -111,6 +111,8 @@ class StoreDevice : public ReferenceDevice, public Platform {
   void setRestoreFiles(std::optional<std::vector<QBFile>> files) override;
   void drain() override;
   DeviceDump dump(bool hash, ErrorPtr* error) override;
+  void readAhead() override { readAhead_->start(store_); }
+  void stopReadingAhead() override { readAhead_->stop(*store_); }
   LibraryDifference difference(const LibraryChanges& changes, ErrorPtr* error) override;
 
   // Platform
@@ -147,6 +149,7 @@ class StoreDevice : public ReferenceDevice, public Platform {
   std::unique_ptr<OverlayFileSystem> plannedFiles_;  // of a device for planning
   FileSystem* files_ = nullptr;                      // the ones in use
   std::unique_ptr<SqliteDatabase> before_;           // of a device for planning that is there
+  const std::shared_ptr<ReadAhead> readAhead_ = std::make_shared<ReadAhead>();
   std::unique_ptr<DeviceLibraryFramework> framework_;
   std::unique_ptr<StoreAdmin> admin_;
   std::unique_ptr<Quarryd> quarryd_;
@@ -185,7 +188,7 @@ ErrorPtr StoreDevice::start() {
                                             : openForWriting()) {
     return failed;
   }
-  framework_ = std::make_unique<DeviceLibraryFramework>(store_);
+  framework_ = std::make_unique<DeviceLibraryFramework>(store_, readAhead_);
   admin_ = std::make_unique<StoreAdmin>(root_, store_);
   saver_ = std::make_unique<DeviceSaver>(quarryd_.get(), globalQueue_);
   porter_ = std::make_unique<DevicePorter>(quarryd_.get());
@@ -299,6 +302,9 @@ void StoreDevice::startQuarryd(std::unique_ptr<MediaStore> media) {
   parts.files = files_;
   parts.filesPerFolder = options_.filesPerFolder;
   quarryd_ = std::make_unique<Quarryd>(std::move(parts));
+  realFiles_->setOnRemoved([this](const std::string& path) {
+    if (path == device_paths::kLastSynced && quarryd_) quarryd_->expectSeal();
+  });
   store_->setFileReleaser(
       [this](std::vector<std::string> paths) { quarryd_->removeFiles(std::move(paths)); });
 }
@@ -372,9 +378,11 @@ LibraryDifference StoreDevice::difference(const LibraryChanges& changes, ErrorPt
 
 StoreDevice::~StoreDevice() {
   if (!store_) return;
+  stopReadingAhead();
   drain();
   const bool filesLeft = !quarryd_ || quarryd_->leftFilesBehind();
   store_->queue().sync([this] { store_->setFileReleaser(nullptr); });
+  realFiles_->setOnRemoved(nullptr);
   porter_.reset();
   saver_.reset();
   quarryd_.reset();

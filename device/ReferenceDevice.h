@@ -128,6 +128,11 @@ class ReferenceDevice {
   // What the backup manager answers from now on: these files while a restore brings them back (no
   // sync is sealed meanwhile), an empty list for nothing, as in the beginning.
   virtual void setRestoreFiles(std::optional<std::vector<QBFile>> files) = 0;
+  // Hints. A sync is about to look at every synced asset: they are read meanwhile. Until the hint
+  // is taken back a library object may take over what one before it has read, whose objects live
+  // on.
+  virtual void readAhead() = 0;
+  virtual void stopReadingAhead() = 0;
   // What sets the library apart from what the device really holds; of a device for planning alone.
   virtual LibraryDifference difference(const LibraryChanges& changes, ErrorPtr* error) = 0;
   // Waits until quarryd and the library's queue have nothing to do.

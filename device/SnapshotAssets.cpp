@@ -5,7 +5,6 @@
 
 #include "platform/foundation/EntryPeek.h"
 #include "platform/foundation/Exceptions.h"
-#include "platform/foundation/Hash.h"
 #include "platform/foundation/Limits.h"
 
 namespace kx {
@@ -83,10 +82,7 @@ class ItemPeek {
 
 }  // namespace
 
-SnapshotAssets::SnapshotAssets(std::size_t most) : most_(most) {
-  std::size_t slots = 16;
-  while (slots < most * 2) slots *= 2;
-  slots_.resize(slots);
+SnapshotAssets::SnapshotAssets(std::size_t most) : most_(most), uuids_(most) {
   assets_.reserve(most);
 }
 
@@ -113,34 +109,26 @@ std::optional<SnapshotAssets> SnapshotAssets::of(const Value& root, std::string*
   }
 }
 
-std::size_t SnapshotAssets::slotOf(std::string_view uuid) const {
-  const std::size_t mask = slots_.size() - 1;
-  std::size_t slot = static_cast<std::size_t>(hashText(uuid)) & mask;
-  while (slots_[slot] != 0 && assets_[slots_[slot] - 1].uuid != uuid) slot = (slot + 1) & mask;
-  return slot;
-}
-
 bool SnapshotAssets::set(std::string_view uuid, double modified) {
-  const std::size_t slot = slotOf(uuid);
-  if (slots_[slot] != 0) {
-    assets_[slots_[slot] - 1].modified = modified;
-    return true;
-  }
-  if (assets_.size() == most_) return false;
-  assets_.push_back({uuid, modified, false});
-  slots_[slot] = static_cast<std::uint32_t>(assets_.size());
+  if (uuids_.size() == most_ && !uuids_.contains(uuid)) return false;
+  const std::uint32_t number = uuids_.add(uuid);
+  if (number == assets_.size()) assets_.emplace_back();
+  assets_[number].modified = modified;
   return true;
 }
 
 SnapshotAssets::Asset* SnapshotAssets::find(std::string_view uuid) {
-  const std::uint32_t place = slots_[slotOf(uuid)];
-  return place == 0 ? nullptr : &assets_[place - 1];
+  const std::uint32_t number = uuids_.find(uuid, next_);
+  if (number == TextNumbers::kNone) return nullptr;
+  next_ = number + 1;
+  return &assets_[number];
 }
 
-const SnapshotAssets::Asset* SnapshotAssets::firstNotProved() const {
-  const auto found = std::find_if(assets_.begin(), assets_.end(),
-                                  [](const Asset& asset) { return !asset.proved; });
-  return found == assets_.end() ? nullptr : &*found;
+OptionalString SnapshotAssets::firstNotProved() const {
+  for (std::size_t number = 0; number < assets_.size(); ++number) {
+    if (!assets_[number].proved) return uuids_.texts()[number];
+  }
+  return std::nullopt;
 }
 
 }  // namespace kx

@@ -7,6 +7,7 @@
 #include <string_view>
 #include <vector>
 
+#include "platform/foundation/TextNumbers.h"
 #include "platform/foundation/Value.h"
 
 namespace kx {
@@ -17,7 +18,6 @@ namespace kx {
 class SnapshotAssets {
  public:
   struct Asset {
-    std::string_view uuid;
     double modified = 0;  // seconds since the reference date
     bool proved = false;
   };
@@ -25,20 +25,20 @@ class SnapshotAssets {
   // Null, and why, when the snapshot makes no sense or lists more assets than a library may have.
   static std::optional<SnapshotAssets> of(const Value& root, std::string* why);
 
-  // Null when the snapshot does not list it.
+  // Null when the snapshot does not list it. Cheapest in the order of the list.
   Asset* find(std::string_view uuid);
-  // Null when all are.
-  const Asset* firstNotProved() const;
+  // The identifier of one that is not proved; null when all are.
+  OptionalString firstNotProved() const;
 
  private:
   explicit SnapshotAssets(std::size_t most);
   // False when there are as many as there may be.
   bool set(std::string_view uuid, double modified);
-  std::size_t slotOf(std::string_view uuid) const;
 
   const std::size_t most_;
-  std::vector<Asset> assets_;
-  std::vector<std::uint32_t> slots_;  // index into assets_ plus 1, 0 when free; half are free
+  TextNumbers uuids_;
+  std::vector<Asset> assets_;  // by their identifiers' numbers
+  std::uint32_t next_ = 0;     // the number after the one found last
 };
 
 }  // namespace kx

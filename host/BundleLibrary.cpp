@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <future>
 #include <mutex>
 #include <system_error>
 #include <utility>
@@ -41,7 +42,12 @@ class BundleLibrary final : public HostLibrary {
   std::string libraryUUID() const override { return rootText(kKXSTransportLibraryUUIDKey); }
   std::string libraryKind() const override { return rootText(kKXSTransportLibraryKindKey); }
   DataPtr snapshotBytes() const override { return snapshot_; }
+  DataPtr takeSnapshotBytes() override { return std::move(snapshot_); }
   const std::vector<HostProblem>& problems() const override { return problems_; }
+
+  void expectMedia() const override {
+    if (!listing_.valid()) listing_ = std::async(std::launch::async, [this] { names(); });
+  }
 
   std::optional<HostMedia> openMedia(std::string_view uuid, ErrorPtr* error) const override {
     const std::string name = nameOf(uuid);
@@ -108,7 +114,9 @@ class BundleLibrary final : public HostLibrary {
   }
 
   std::string rootText(std::string_view key) const {
-    std::call_once(decoded_, [this] { root_ = readPropertyList(snapshot_, nullptr); });
+    std::call_once(decoded_, [this] {
+      if (snapshot_) root_ = readPropertyList(snapshot_, nullptr);
+    });
     const Value value = root_[key];
     return value.isString() ? std::string(value.stringValue()) : std::string();
   }
@@ -122,6 +130,7 @@ class BundleLibrary final : public HostLibrary {
   mutable Names names_;
   mutable std::once_flag decoded_;
   mutable Value root_;
+  mutable std::future<void> listing_;  // last: it uses the rest
 };
 
 }  // namespace

@@ -205,6 +205,7 @@ class FolderLibrary final : public HostLibrary {
   std::string libraryUUID() const override { return identity_.library(); }
   std::string libraryKind() const override { return "Folder"; }
   DataPtr snapshotBytes() const override { return snapshot_; }
+  DataPtr takeSnapshotBytes() override { return std::move(snapshot_); }
   const std::vector<HostProblem>& problems() const override { return problems_; }
 
   std::optional<HostMedia> openMedia(std::string_view uuid, ErrorPtr* error) const override {

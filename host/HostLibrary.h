@@ -108,6 +108,12 @@ class HostLibrary {
   // The snapshot: a property list. A folder's has the same bytes whenever the folder is unchanged.
   // A bundle's is the file as it stands, unchecked.
   virtual DataPtr snapshotBytes() const = 0;
+  // The same, which the library keeps no longer: snapshotBytes is null from then on, and a bundle
+  // knows neither UUID nor kind.
+  virtual DataPtr takeSnapshotBytes() = 0;
+
+  // A hint: media files are going to be asked for.
+  virtual void expectMedia() const {}
 
   // The file of an asset. Null and an error: ENOENT when the host has no file for it, ELOOP for a
   // link, EINVAL for what is no regular file, else what the system said.

@@ -39,6 +39,8 @@ class FakeDevice : public ReferenceDevice {
   void setRestoreFiles(std::optional<std::vector<QBFile>>) override {}
   void drain() override { memory.saver.drain(); }
   DeviceDump dump(bool, ErrorPtr*) override { return content; }
+  void readAhead() override {}
+  void stopReadingAhead() override {}
   LibraryDifference difference(const LibraryChanges&, ErrorPtr*) override { return {}; }
 
   TestPlatform memory;

@@ -8,7 +8,7 @@ namespace {
 // The reference device under the suite that every library has to pass.
 class SqliteContractDevice : public ContractDevice {
  public:
-  SqliteContractDevice() {
+  explicit SqliteContractDevice(bool readsAhead = false) : readsAhead_(readsAhead) {
     FaultVfs::shared().reset();
     DeviceOptions options;
     options.root = directory_.path();
@@ -17,7 +17,10 @@ class SqliteContractDevice : public ContractDevice {
   }
   ~SqliteContractDevice() override { FaultVfs::shared().reset(); }
 
-  Platform& platform() override { return device_->platform(); }
+  Platform& platform() override {
+    if (readsAhead_) device_->readAhead();
+    return device_->platform();
+  }
 
   void addAsset(const AssetSeed& seed) override {
     NewDeviceAsset asset;
@@ -69,6 +72,7 @@ class SqliteContractDevice : public ContractDevice {
   void failNextCommit() override { FaultVfs::shared().failAt(0, SQLITE_FULL); }
 
  private:
+  const bool readsAhead_;
   TemporaryDirectory directory_;
   std::unique_ptr<ReferenceDevice> device_;
 };
@@ -77,7 +81,13 @@ std::unique_ptr<ContractDevice> makeSqliteDevice() {
   return std::make_unique<SqliteContractDevice>();
 }
 
+std::unique_ptr<ContractDevice> makeSqliteDeviceThatReadsAhead() {
+  return std::make_unique<SqliteContractDevice>(true);
+}
+
 INSTANTIATE_TEST_SUITE_P(Sqlite, PhotoLibraryContract, ::testing::Values(&makeSqliteDevice));
+INSTANTIATE_TEST_SUITE_P(SqliteReadAhead, PhotoLibraryContract,
+                         ::testing::Values(&makeSqliteDeviceThatReadsAhead));
 
 }  // namespace
 }  // namespace kx

@@ -39,6 +39,34 @@ TEST_F(SealTest, LeavesAnEqualCopyAlone) {
   EXPECT_EQ(device().takeCounters().rowsWritten, 0U);
 }
 
+// Its going makes the device read what the next proof takes.
+TEST_F(SealTest, AfterItIsGoneTheSnapshotInPlaceThenIsProved) {
+  const auto unseal = [&] {
+    ASSERT_TRUE(platform().files().removeItem(device_paths::kLastSynced, nullptr));
+    device().drain();
+  };
+  putSnapshot({kUUID1});
+  save({importJob(kUUID1, kJpeg), sealJob()});
+  ASSERT_TRUE(sealed()) << reason();
+  unseal();
+  save({sealJob()});
+  EXPECT_EQ(content(device_paths::kLastSynced), content(device_paths::kSnapshot)) << reason();
+
+  unseal();
+  putSnapshot({kUUID1, kUUID2});
+  save({sealJob()});
+  EXPECT_FALSE(sealed());
+  EXPECT_NE(reason().find(kUUID2 + " is not in the library"), std::string::npos) << reason();
+
+  putSnapshot({kUUID1});
+  save({sealJob()});
+  unseal();
+  transaction([&] { library().assetWithUUID(kUUID1)->deleteObject(); });
+  save({sealJob()});
+  EXPECT_FALSE(sealed());
+  EXPECT_NE(reason().find(kUUID1 + " is not in the library"), std::string::npos) << reason();
+}
+
 TEST_F(SealTest, IsWithheldForAMissingAsset) {
   putSnapshot({kUUID1, kUUID2});
   save({importJob(kUUID1, kJpeg), sealJob()});
