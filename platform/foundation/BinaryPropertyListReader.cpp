@@ -62,9 +62,9 @@ std::string BinaryPropertyListReader::path() const {
       result += '[' + std::to_string(position) + ']';
       continue;
     }
-    const DocumentNode& key = nodes_[document_->reference(nodes_[frame.object], position)];
+    const std::uint32_t key = document_->reference(nodes_[frame.object].low, position);
     if (!result.empty()) result += '.';
-    result += escapeControlCharacters(document_->text(key));
+    result += escapeControlCharacters(document_->text(nodes_[key]));
   }
   return result;
 }
@@ -73,8 +73,10 @@ Value BinaryPropertyListReader::read() {
   readTrailer();
   document_->count_ = count_;
   document_->referenceSize_ = referenceSize_;
-  document_->nodes_ = makeLazyArray<DocumentNode>(count_);
+  // Every node is written before it is read: the walk and readUnreferenced() meet every object.
+  document_->nodes_ = makeRawArray<DocumentNode>(count_);
   nodes_ = document_->nodes_.get();
+  states_ = makeLazyArray<State>(count_);
   walk(root_);
   readUnreferenced();
   document_->indexLargeDictionaries(largeDictionaries_);
@@ -134,9 +136,9 @@ void BinaryPropertyListReader::readTrailer() {
 void BinaryPropertyListReader::readUnreferenced() {
   if (readCount_ == count_) return;
   for (std::uint32_t object = 0; object < count_; ++object) {
-    DocumentNode& node = nodes_[object];
-    if (node.kind != Kind::kNull) continue;
+    if (states_[object] != kUnread) continue;
     readObject(object);
+    const DocumentNode& node = nodes_[object];
     const bool isDictionary = node.kind == Kind::kDictionary;
     if (!isDictionary && node.kind != Kind::kArray) continue;
     const std::size_t references = std::size_t{node.high} * (isDictionary ? 2 : 1);

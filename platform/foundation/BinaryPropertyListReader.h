@@ -23,6 +23,10 @@ class BinaryPropertyListReader {
   static bool isBinary(const std::uint8_t* bytes, std::size_t length);
 
  private:
+  // How far an object has been read; a container that has been walked has kWalked plus the nesting
+  // at and below it.
+  enum State : std::uint8_t { kUnread, kRead, kOpen, kWalked };
+
   // A container that is being walked.
   struct Frame {
     std::uint32_t object;
@@ -51,16 +55,19 @@ class BinaryPropertyListReader {
   }
   // Reads the object's own bytes into its node.
   void readObject(std::uint32_t object);
-  void readScalar(DocumentNode& node, std::size_t offset, unsigned marker);
+  void readContainer(DocumentNode& node, std::size_t offset, unsigned marker);
+  void readAscii(DocumentNode& node, std::size_t offset, unsigned marker);
+  void readRare(DocumentNode& node, std::size_t offset, unsigned marker);
   void readInteger(DocumentNode& node, std::size_t offset, unsigned marker);
-  void readWideInteger(DocumentNode& node, std::size_t offset);
   void readDate(DocumentNode& node, std::size_t offset);
   void readUid(DocumentNode& node, std::size_t offset, unsigned marker);
   void readData(DocumentNode& node, std::size_t offset, unsigned marker);
-  void readAscii(DocumentNode& node, std::size_t offset, unsigned marker);
   void readUtf16(DocumentNode& node, std::size_t offset, unsigned marker);
-  void readContainer(DocumentNode& node, std::size_t offset, unsigned marker);
+  [[noreturn]] void failPlace(std::uint32_t object, std::uint64_t place) const;
+  [[noreturn]] void failAscii(std::size_t offset, std::size_t length) const;
+  [[noreturn]] void failStringLength(std::size_t offset) const;
   Length readLength(std::size_t offset, unsigned marker, unsigned unitBytes);
+  Length readLongLength(std::size_t offset) const;
   // Counts the bytes of an object: together they never exceed the bytes that hold objects.
   void claim(std::size_t offset, std::size_t end);
   void requireFixed(std::size_t offset, std::size_t size);
@@ -72,9 +79,11 @@ class BinaryPropertyListReader {
   }
   void walk(std::uint32_t root);
   void enter(std::uint32_t object);
-  void checkKeys(const Frame& frame);
+  void checkKeys(std::uint32_t object);
+  // The number of a key's text.
+  std::uint32_t readKey(const std::uint8_t* place);
   void advance(Frame& frame);
-  void visitContainer(Frame& frame, std::uint32_t object, const std::uint8_t* place);
+  void visitAgain(Frame& frame, std::uint32_t object, const std::uint8_t* place);
   void leave();
   void readUnreferenced();
 
@@ -91,6 +100,7 @@ class BinaryPropertyListReader {
   std::size_t claimed_ = 0;
   std::uint64_t readCount_ = 0;
   DocumentNode* nodes_ = nullptr;
+  LazyArray<State> states_;
   std::vector<Frame> stack_;
   std::vector<std::uint32_t> lastDictionaryOfKey_;  // object plus 1, by key number
   std::vector<std::uint32_t> largeDictionaries_;
