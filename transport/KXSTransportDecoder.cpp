@@ -1,6 +1,7 @@
 #include "transport/KXSTransportDecoder.h"
 
 #include <algorithm>
+#include <array>
 
 #include "platform/foundation/EntryPeek.h"
 #include "platform/foundation/Limits.h"
@@ -79,14 +80,43 @@ struct Collections {
   void add(ClassifiedItem classified) {
     Value key = keyOf(*classified.item);
     if (classified.itemClass == ItemClass::kAsset) {
-      assets->set(std::move(key), std::static_pointer_cast<KXSAsset>(std::move(classified.item)));
-      checkCount(assets->size(), limits::kAssets, "assets");
+      Pending& next = pending[pendingCount++ % kMostPending];
+      if (next.asset) insert(next);
+      const std::uint64_t hash = assets->announce(key.stringValue());
+      next = {std::move(key), std::static_pointer_cast<KXSAsset>(std::move(classified.item)), hash};
       return;
     }
     ordered->push_back(classified.item);
     containers->set(std::move(key), std::move(classified.item));
     checkCount(ordered->size(), limits::kContainers, "albums and events");
   }
+
+  // Inserts the assets that still wait, in their order. Before this nothing is to be seen or thrown
+  // that comes after them.
+  void insertPending() {
+    for (std::size_t i = 0; i < kMostPending; ++i) {
+      Pending& next = pending[pendingCount++ % kMostPending];
+      if (next.asset) insert(next);
+    }
+  }
+
+ private:
+  // Assets wait a little before they go into the map: its table is much larger than the processor's
+  // caches, and what is needed of it is fetched meanwhile.
+  struct Pending {
+    Value key;
+    KXSAssetPtr asset;
+    std::uint64_t hash = 0;
+  };
+  static constexpr std::size_t kMostPending = 16;
+
+  void insert(Pending& next) {
+    assets->setHashed(std::move(next.key), std::move(next.asset), next.hash);
+    checkCount(assets->size(), limits::kAssets, "assets");
+  }
+
+  std::array<Pending, kMostPending> pending;
+  std::size_t pendingCount = 0;
 };
 
 // A list can name one item very often: more room than this is made as it is needed.
@@ -98,9 +128,16 @@ Collections decodeUpdates(const Value& root, RecordLayouts& layouts) {
   if (!updates) return collections;
   const std::size_t count = updates->size();
   collections.assets->reserve(std::min(count, kMostReserved));
-  for (std::size_t i = 0; i < count; ++i) {
-    collections.add(itemFromPropertyList((*updates)[i], layouts));
+  try {
+    for (std::size_t i = 0; i < count; ++i) {
+      updates->prefetchBehind(i);
+      collections.add(itemFromPropertyList((*updates)[i], layouts));
+    }
+  } catch (...) {
+    collections.insertPending();  // the first item that cannot be stored is the one that counts
+    throw;
   }
+  collections.insertPending();
   return collections;
 }
 
