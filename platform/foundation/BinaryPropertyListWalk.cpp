@@ -25,13 +25,21 @@ bool isBadAscii(std::uint8_t byte) { return byte == 0 || byte >= 0x80; }
 
 // Whether no byte is NUL or above ASCII. 8 bytes are tested at once; at least 8 bytes must be
 // readable behind the text.
-bool isGoodAscii(const std::uint8_t* text, std::size_t length) {
+[[gnu::always_inline]] inline bool isGoodAscii(const std::uint8_t* text, std::size_t length) {
   constexpr std::uint64_t kHigh = 0x8080808080808080U;
   std::uint64_t bad = 0;
   std::uint64_t word = 0;
-  for (; length >= 8; text += 8, length -= 8) {
+  for (; length >= 16; text += 16, length -= 16) {
+    std::uint64_t more = 0;
+    std::memcpy(&word, text, 8);
+    std::memcpy(&more, text + 8, 8);
+    bad |= (word - kOnes) | word | (more - kOnes) | more;
+  }
+  if (length >= 8) {
     std::memcpy(&word, text, 8);
     bad |= (word - kOnes) | word;
+    text += 8;
+    length -= 8;
   }
   std::memcpy(&word, text, 8);
   const std::uint64_t mask = (std::uint64_t{1} << (8 * length)) - 1;
@@ -46,18 +54,29 @@ unsigned loadUnit(const std::uint8_t* from) {
 
 }  // namespace
 
-inline void BinaryPropertyListReader::claim(std::size_t offset, std::size_t end) {
-  claimed_ += end - offset;
-  if (claimed_ > tableStart_ - kHeaderBytes) {
-    fail(PropertyListError::kOffset, "objects overlap", offset);
-  }
+[[gnu::always_inline]] inline void BinaryPropertyListReader::claim(std::size_t offset,
+                                                                   std::size_t bytes) {
+  if (bytes > unclaimed_) failOverlap(offset);
+  unclaimed_ -= bytes;
 }
 
-inline void BinaryPropertyListReader::requireFixed(std::size_t offset, std::size_t size) {
-  if (tableStart_ - offset < 1 + size) {
-    fail(PropertyListError::kOffset, "an object runs into the offset table", offset);
-  }
-  claim(offset, offset + 1 + size);
+[[gnu::always_inline]] inline void BinaryPropertyListReader::requireFixed(std::size_t offset,
+                                                                          std::size_t size) {
+  if (tableStart_ - offset < 1 + size) failEnd(offset);
+  claim(offset, 1 + size);
+}
+
+void BinaryPropertyListReader::failOverlap(std::size_t offset) const {
+  fail(PropertyListError::kOffset, "objects overlap", offset);
+}
+
+void BinaryPropertyListReader::failEnd(std::size_t offset) const {
+  fail(PropertyListError::kOffset, "an object runs into the offset table", offset);
+}
+
+void BinaryPropertyListReader::failLength(std::uint64_t count, std::size_t offset) const {
+  fail(PropertyListError::kLength,
+       "a length of " + std::to_string(count) + " exceeds the bytes left", offset);
 }
 
 void BinaryPropertyListReader::failPlace(std::uint32_t object, std::uint64_t place) const {
@@ -100,23 +119,27 @@ BinaryPropertyListReader::Length BinaryPropertyListReader::readLongLength(
 
 // Reads a length and checks it against the bytes left before the table, each unit taking
 // `unitBytes`.
-inline BinaryPropertyListReader::Length BinaryPropertyListReader::readLength(std::size_t offset,
-                                                                             unsigned marker,
-                                                                             unsigned unitBytes) {
+[[gnu::always_inline]] inline BinaryPropertyListReader::Length BinaryPropertyListReader::readLength(
+    std::size_t offset, unsigned marker, unsigned unitBytes) {
   Length length{marker & 0xF, offset + 1};
-  if (length.count == 0xF) length = readLongLength(offset);
+  if (length.count == 0xF) {
+    // Most lengths of their own have one byte; what is read here lies before the end of the file.
+    length = base_[offset + 1] == 0x10 && offset + 2 < tableStart_
+                 ? Length{base_[offset + 2], offset + 3}
+                 : readLongLength(offset);
+  }
   std::uint64_t bytes = 0;
   if (__builtin_mul_overflow(length.count, std::uint64_t{unitBytes}, &bytes) ||
       bytes > tableStart_ - length.contentOffset) {
-    fail(PropertyListError::kLength,
-         "a length of " + std::to_string(length.count) + " exceeds the bytes left", offset);
+    failLength(length.count, offset);
   }
-  claim(offset, length.contentOffset + static_cast<std::size_t>(bytes));
+  claim(offset, length.contentOffset + static_cast<std::size_t>(bytes) - offset);
   return length;
 }
 
-inline void BinaryPropertyListReader::readAscii(DocumentNode& node, std::size_t offset,
-                                                unsigned marker) {
+[[gnu::always_inline]] inline void BinaryPropertyListReader::readAscii(DocumentNode& node,
+                                                                       std::size_t offset,
+                                                                       unsigned marker) {
   const Length length = readLength(offset, marker, 1);
   if (length.count > limits_.stringBytes) failStringLength(offset);
   const auto count = static_cast<std::size_t>(length.count);
@@ -125,8 +148,9 @@ inline void BinaryPropertyListReader::readAscii(DocumentNode& node, std::size_t 
           Kind::kString, DocumentNode::kInFile};
 }
 
-inline void BinaryPropertyListReader::readContainer(DocumentNode& node, std::size_t offset,
-                                                    unsigned marker) {
+[[gnu::always_inline]] inline void BinaryPropertyListReader::readContainer(DocumentNode& node,
+                                                                           std::size_t offset,
+                                                                           unsigned marker) {
   const bool isDictionary = marker >> 4 == 0xD;
   const Length length = readLength(offset, marker, referenceSize_ * (isDictionary ? 2 : 1));
   node = {static_cast<std::uint32_t>(length.contentOffset),
@@ -135,10 +159,10 @@ inline void BinaryPropertyListReader::readContainer(DocumentNode& node, std::siz
 }
 
 // What there is most of stands here, the rest elsewhere.
-inline void BinaryPropertyListReader::readObject(std::uint32_t object) {
+[[gnu::always_inline]] inline void BinaryPropertyListReader::readObjectInLine(
+    std::uint32_t object) {
   const std::uint64_t place = offsetOf(object);
   if (place < kHeaderBytes || place >= tableStart_) failPlace(object, place);
-  ++readCount_;
   states_[object] = kRead;
   const auto offset = static_cast<std::size_t>(place);
   DocumentNode& node = nodes_[object];
@@ -155,6 +179,8 @@ inline void BinaryPropertyListReader::readObject(std::uint32_t object) {
     readRare(node, offset, marker);
   }
 }
+
+void BinaryPropertyListReader::readObject(std::uint32_t object) { readObjectInLine(object); }
 
 void BinaryPropertyListReader::readRare(DocumentNode& node, std::size_t offset, unsigned marker) {
   node = {0, 0, 0, Kind::kNumber, 0};
@@ -274,12 +300,11 @@ void BinaryPropertyListReader::readUtf16(DocumentNode& node, std::size_t offset,
 }
 
 void BinaryPropertyListReader::walk(std::uint32_t root) {
-  stack_.reserve(limits_.nestingDepth);
   readObject(root);
   if (nodes_[root].kind != Kind::kArray && nodes_[root].kind != Kind::kDictionary) return;
   enter(root);
-  while (!stack_.empty()) {
-    Frame& frame = stack_.back();
+  while (depth_ != 0) {
+    Frame& frame = stack_[depth_ - 1];
     if (frame.next == frame.count) {
       leave();
     } else {
@@ -289,15 +314,15 @@ void BinaryPropertyListReader::walk(std::uint32_t root) {
 }
 
 inline void BinaryPropertyListReader::enter(std::uint32_t object) {
-  if (stack_.size() >= limits_.nestingDepth) {
+  if (depth_ >= limits_.nestingDepth) {
     failDepth(offsetOf(object));
   }
   states_[object] = kOpen;
   const DocumentNode& node = nodes_[object];
   const bool isDictionary = node.kind == Kind::kDictionary;
   const std::uint32_t keys = isDictionary ? node.high : 0;
-  stack_.push_back(Frame{object, 0, node.high, 1 + keys,
-                         base_ + node.low + std::size_t{keys} * referenceSize_, 0});
+  stack_[depth_++] = {
+      object, 0, node.high, 1 + keys, base_ + node.low + std::size_t{keys} * referenceSize_, 0};
   if (isDictionary) checkKeys(object);
 }
 
@@ -348,22 +373,30 @@ std::uint32_t BinaryPropertyListReader::readKey(const std::uint8_t* place) {
 
 // Goes over elements up to the next container that has to be entered, or to the end.
 void BinaryPropertyListReader::advance(Frame& frame) {
-  const std::uint8_t* place = frame.values + std::size_t{frame.next} * referenceSize_;
+  const unsigned size = referenceSize_;
   const std::uint32_t count = frame.count;
-  for (std::uint32_t next = frame.next; next < count; place += referenceSize_) {
+  const std::uint8_t* place = frame.values + std::size_t{frame.next} * size;
+  std::uint32_t scalars = 0;
+  for (std::uint32_t next = frame.next; next < count; place += size) {
     frame.next = ++next;  // where path() looks
     const std::uint32_t object = referenceAt(place);
     const State state = states_[object];
     if (state == kUnread) {
-      readObject(object);
+      readObjectInLine(object);
       const Kind kind = nodes_[object].kind;
-      if (kind == Kind::kArray || kind == Kind::kDictionary) return enter(object);
+      if (kind == Kind::kArray || kind == Kind::kDictionary) {
+        frame.visits += scalars;
+        return enter(object);
+      }
     } else if (state != kRead) {
+      frame.visits += scalars;
+      scalars = 0;
       visitAgain(frame, object, place);
       continue;
     }
-    ++frame.visits;
+    ++scalars;
   }
+  frame.visits += scalars;
 }
 
 // A container that has been entered before.
@@ -374,7 +407,7 @@ void BinaryPropertyListReader::visitAgain(Frame& frame, std::uint32_t object,
     fail(PropertyListError::kCycle, "object " + std::to_string(object) + " holds itself", offset);
   }
   const auto height = static_cast<std::uint8_t>(states_[object] - kWalked);
-  if (stack_.size() + height > limits_.nestingDepth) {
+  if (depth_ + height > limits_.nestingDepth) {
     failDepth(offset);
   }
   frame.height = std::max(frame.height, height);
@@ -385,16 +418,15 @@ void BinaryPropertyListReader::visitAgain(Frame& frame, std::uint32_t object,
 }
 
 inline void BinaryPropertyListReader::leave() {
-  const Frame frame = stack_.back();
+  const Frame& frame = stack_[depth_ - 1];
   if (frame.visits > limits_.visits) {
     failExpansion(offsetOf(frame.object));
   }
   const auto height = static_cast<std::uint8_t>(frame.height + 1);
   states_[frame.object] = static_cast<State>(kWalked + height);
   nodes_[frame.object].extra = frame.visits;
-  stack_.pop_back();
-  if (stack_.empty()) return;
-  Frame& parent = stack_.back();
+  if (--depth_ == 0) return;
+  Frame& parent = stack_[depth_ - 1];
   parent.height = std::max(parent.height, height);
   parent.visits += frame.visits;
   if (parent.visits > limits_.visits) {

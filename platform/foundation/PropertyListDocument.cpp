@@ -93,13 +93,14 @@ void PropertyListDocument::growKeyTable() {
   }
 }
 
-std::size_t PropertyListDocument::positionOf(const Value& dictionary, std::string_view key) const {
+std::size_t PropertyListDocument::positionOf(const Value& dictionary, std::string_view key,
+                                             std::uint32_t expected) const {
   const std::uint32_t place = ValueAccess::place(dictionary);
   const std::uint32_t count = ValueAccess::size(dictionary);
+  if (expected < count && isText(reference(place, expected), key)) return expected;
   if (count <= kTextScanLimit) {
     for (std::uint32_t i = 0; i < count; ++i) {
-      const DocumentNode& node = nodes_[reference(place, i)];
-      if (node.high == key.size() && text(node) == key) return i;
+      if (isText(reference(place, i), key)) return i;
     }
     return kNone;
   }

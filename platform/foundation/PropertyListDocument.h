@@ -106,7 +106,7 @@ class PropertyListDocument final : public ValueStorage {
   std::uint32_t reference(std::uint32_t place, std::size_t position) const {
     if (referenceSize_ == 0) return references_[place + position];
     return static_cast<std::uint32_t>(
-        loadBig(base_ + place + position * referenceSize_, referenceSize_));
+        loadBigShifted(base_ + place + position * referenceSize_, referenceShift_));
   }
   // The first `count` references of a container as they are stored. Within one document equal bytes
   // are equal references.
@@ -116,8 +116,9 @@ class PropertyListDocument final : public ValueStorage {
     }
     return {reinterpret_cast<const char*>(base_) + place, count * referenceSize_};
   }
-  // Position of a key in a dictionary of this document, or kNone.
-  std::size_t positionOf(const Value& dictionary, std::string_view key) const;
+  // Position of a key in a dictionary of this document, or kNone. Found at once at `expected`.
+  std::size_t positionOf(const Value& dictionary, std::string_view key,
+                         std::uint32_t expected = 0) const;
   static constexpr std::size_t kNone = static_cast<std::size_t>(-1);
   // Dictionaries up to this size are scanned, larger ones get an index; in the smallest the texts
   // are compared, in the others the keys' numbers.
@@ -126,9 +127,14 @@ class PropertyListDocument final : public ValueStorage {
 
   // Reads a big-endian integer of 1 to 8 bytes; 8 bytes from `from` on must be readable.
   static std::uint64_t loadBig(const std::uint8_t* from, unsigned size) {
+    return loadBigShifted(from, shiftOf(size));
+  }
+  // The same for loops: with the shift for that size.
+  static unsigned shiftOf(unsigned size) { return 64 - 8 * size; }
+  static std::uint64_t loadBigShifted(const std::uint8_t* from, unsigned shift) {
     std::uint64_t raw;
     std::memcpy(&raw, from, sizeof(raw));
-    return __builtin_bswap64(raw) >> (64 - 8 * size);
+    return __builtin_bswap64(raw) >> shift;
   }
 
  private:
@@ -139,6 +145,11 @@ class PropertyListDocument final : public ValueStorage {
   struct LargeIndex {
     std::vector<std::uint32_t> slots;
   };
+
+  bool isText(std::uint32_t object, std::string_view text) const {
+    const DocumentNode& node = nodes_[object];
+    return node.high == text.size() && this->text(node) == text;
+  }
 
   // The number of the key with this text, or kNoKey.
   static constexpr std::uint32_t kNoKey = 0xFFFFFFFF;
@@ -156,6 +167,7 @@ class PropertyListDocument final : public ValueStorage {
   LazyArray<DocumentNode> nodes_;
   std::uint32_t count_ = 0;
   unsigned referenceSize_ = 0;  // bytes of a reference in the file; 0: references_ holds them
+  unsigned referenceShift_ = 0;
   LazyArray<std::uint32_t> references_;
   DocumentArena arena_;
 
