@@ -36,9 +36,10 @@ class EntryPeek {
     return EntryPeek(*document,
                      document->reference(ValueAccess::place(dictionary), count + position));
   }
-  // The value under a key of a dictionary.
-  static std::optional<EntryPeek> find(const Value& dictionary, std::string_view key) {
-    const std::size_t position = documentOf(dictionary)->positionOf(dictionary, key);
+  // The value under a key of a dictionary, which is found fastest at the expected position.
+  static std::optional<EntryPeek> find(const Value& dictionary, std::string_view key,
+                                       std::uint32_t expected) {
+    const std::size_t position = documentOf(dictionary)->positionOf(dictionary, key, expected);
     if (position == PropertyListDocument::kNone) return std::nullopt;
     return valueOf(dictionary, position);
   }

@@ -71,12 +71,6 @@ std::uint64_t Number::uint64Value() const {
   return static_cast<std::uint64_t>(value);
 }
 
-double Number::doubleValue() const {
-  if (isReal()) return std::bit_cast<double>(bits_);
-  if (type_ == Type::kUnsigned) return static_cast<double>(bits_);
-  return static_cast<double>(static_cast<std::int64_t>(bits_));
-}
-
 std::string Number::description() const {
   switch (type_) {
     case Type::kBoolean:

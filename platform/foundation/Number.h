@@ -1,5 +1,6 @@
 #pragma once
 
+#include <bit>
 #include <cstdint>
 #include <string>
 
@@ -32,7 +33,11 @@ class Number {
   std::uint64_t uint64Value() const;
   std::int32_t int32Value() const { return static_cast<std::int32_t>(int64Value()); }
   std::int16_t int16Value() const { return static_cast<std::int16_t>(int64Value()); }
-  double doubleValue() const;
+  double doubleValue() const {
+    if (isReal()) return std::bit_cast<double>(bits_);
+    if (type_ == Type::kUnsigned) return static_cast<double>(bits_);
+    return static_cast<double>(static_cast<std::int64_t>(bits_));
+  }
 
   // Booleans print as 1 and 0, reals with the shortest text that reads back the same.
   std::string description() const;

@@ -14,6 +14,13 @@ namespace {
 // How many elements ahead of a loop it is worth to fetch.
 constexpr std::size_t kNear = 8;
 
+// As ValueAccess::document, in line.
+inline const PropertyListDocument* documentOf(const Value& value) {
+  return ValueAccess::inDocument(value)
+             ? static_cast<const PropertyListDocument*>(ValueAccess::owner(value))
+             : nullptr;
+}
+
 void requireRoom(std::size_t size) {
   if (size > std::numeric_limits<std::uint32_t>::max() - 1) {
     throw InternalInconsistency("a value is too large");
@@ -233,7 +240,7 @@ DictionaryView Value::dictionaryValue() const {
 
 Value Value::operator[](std::string_view key) const {
   if (kind_ != Kind::kDictionary) return Value();
-  if (const PropertyListDocument* document = ValueAccess::document(*this)) {
+  if (const PropertyListDocument* document = documentOf(*this)) {
     const std::size_t position = document->positionOf(*this, key);
     if (position == PropertyListDocument::kNone) return Value();
     return document->valueAt(document->reference(ValueAccess::place(*this), size_ + position));
@@ -245,10 +252,10 @@ Value Value::operator[](std::string_view key) const {
 std::size_t ArrayView::size() const { return ValueAccess::size(value_); }
 
 OptionalString ArrayView::stringAt(std::size_t index, std::string_view key) const {
-  if (index >= size()) throw InternalInconsistency("array index out of bounds");
-  const PropertyListDocument* document = ValueAccess::document(value_);
+  if (index >= ValueAccess::size(value_)) throw InternalInconsistency("array index out of bounds");
+  const PropertyListDocument* document = documentOf(value_);
   if (document == nullptr) return ValueAccess::elements(value_)[index].asString(key);
-  if (index + kNear < size()) {
+  if (index + kNear < ValueAccess::size(value_)) {
     document->prefetchNode(document->reference(ValueAccess::place(value_), index + kNear));
   }
   const DocumentNode& node = document->node(document->reference(ValueAccess::place(value_), index));
@@ -259,16 +266,16 @@ OptionalString ArrayView::stringAt(std::size_t index, std::string_view key) cons
 }
 
 void ArrayView::prefetchBehind(std::size_t index) const {
-  const PropertyListDocument* document = ValueAccess::document(value_);
-  if (document == nullptr || index + 2 * kNear >= size()) return;
+  const PropertyListDocument* document = documentOf(value_);
+  if (document == nullptr || index + 2 * kNear >= ValueAccess::size(value_)) return;
   const std::uint32_t place = ValueAccess::place(value_);
   document->prefetchNode(document->reference(place, index + 2 * kNear));
   document->prefetchContent(document->reference(place, index + kNear));
 }
 
 Value ArrayView::operator[](std::size_t index) const {
-  if (index >= size()) throw InternalInconsistency("array index out of bounds");
-  if (const PropertyListDocument* document = ValueAccess::document(value_)) {
+  if (index >= ValueAccess::size(value_)) throw InternalInconsistency("array index out of bounds");
+  if (const PropertyListDocument* document = documentOf(value_)) {
     return document->valueAt(document->reference(ValueAccess::place(value_), index));
   }
   return ValueAccess::elements(value_)[index];
