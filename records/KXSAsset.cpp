@@ -69,8 +69,9 @@ KXSAssetPtr KXSAsset::initFromPropertyList(const Value& dictionary) {
 }
 
 KXSAssetPtr KXSAsset::initFromPropertyList(Value dictionary,
-                                           const RecordFields::Positions& positions) {
-  return std::make_shared<KXSAsset>(Token(), RecordFields(std::move(dictionary), positions));
+                                           const RecordFields::Positions& positions,
+                                           RecordBlocks& blocks) {
+  return blocks.make<KXSAsset>(Token(), RecordFields(std::move(dictionary), positions));
 }
 
 KXSAssetPtr KXSAsset::initWithCoder(KeyedUnarchiver& coder) {
@@ -149,6 +150,7 @@ bool KXSAsset::isVideo() const {
 }
 
 std::optional<ArrayView> KXSAsset::adjustments() const {
+  if (fields_.isNull(kAdjustments)) return std::nullopt;
   return fields_.value(kAdjustments).asArray(kKXSAssetAdjustmentsKey);
 }
 
@@ -159,6 +161,7 @@ std::optional<Number> KXSAsset::exposureDate() const {
 }
 
 std::optional<ArrayView> KXSAsset::facesInfo() const {
+  if (fields_.isNull(kFaces)) return std::nullopt;
   return fields_.value(kFaces).asArray(kKXSAssetFacesKey);
 }
 

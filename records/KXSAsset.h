@@ -10,6 +10,7 @@
 #include "records/KXSAssetProperties.h"
 #include "records/KXSFace.h"
 #include "records/KXSItem.h"
+#include "records/RecordBlocks.h"
 
 namespace kx {
 
@@ -28,9 +29,10 @@ class KXSAsset final : public KXSItem {
   static KXSAssetPtr initWithUUID(OptionalString uuid);
   // A missing exposure date is the modification date.
   static KXSAssetPtr initFromPropertyList(const Value& dictionary);
-  // The same, with positions found before (RecordLayouts).
+  // The same, with positions found before (RecordLayouts) and in memory of these blocks.
   static KXSAssetPtr initFromPropertyList(Value dictionary,
-                                          const RecordFields::Positions& positions);
+                                          const RecordFields::Positions& positions,
+                                          RecordBlocks& blocks);
   // Dates and location are not archived: they come back null.
   static KXSAssetPtr initWithCoder(KeyedUnarchiver& coder);
   ~KXSAsset() override;
