@@ -59,7 +59,10 @@ class KXSAsset final : public KXSItem {
   }
   void setIsFlagged(Value isFlagged) { fields_.set(kIsFlagged, std::move(isFlagged)); }
   // False when absent.
-  bool isVideo() const;
+  bool isVideo() const {
+    const std::optional<Number> number = fields_.number(kIsVideo, kKXSAssetIsVideoKey);
+    return number && number->boolValue();
+  }
   void setIsVideo(bool isVideo) { fields_.set(kIsVideo, Value::boolean(isVideo)); }
   OptionalString caption() const { return fields_.string(kCaption, kKXSAssetCaptionKey); }
   void setCaption(OptionalString caption) { fields_.set(kCaption, Value::optionalString(caption)); }
@@ -67,7 +70,11 @@ class KXSAsset final : public KXSItem {
   void setEventUUID(OptionalString uuid) { fields_.set(kEventUUID, Value::optionalString(uuid)); }
   std::optional<ArrayView> adjustments() const;
   void setAdjustments(Value adjustments) { fields_.set(kAdjustments, std::move(adjustments)); }
-  std::optional<Number> exposureDate() const;
+  std::optional<Number> exposureDate() const {
+    const bool isFallback = fields_.sharesEntry(kExposureDate, kModificationDate);
+    return fields_.number(kExposureDate,
+                          isFallback ? kKXSAssetModificationDateKey : kKXSAssetExposureDateKey);
+  }
   void setExposureDate(Value seconds) { fields_.set(kExposureDate, std::move(seconds)); }
   std::optional<Number> modificationDate() const {
     return fields_.number(kModificationDate, kKXSAssetModificationDateKey);

@@ -82,10 +82,6 @@ std::size_t RecordFields::count(std::size_t slot) const {
   return array.isArray() ? array.arrayValue().size() : 0;
 }
 
-bool RecordFields::sharesEntry(std::size_t slot, std::size_t other) const {
-  return !values_ && positions_[slot] != kAbsent && positions_[slot] == positions_[other];
-}
-
 void RecordFields::set(std::size_t slot, Value value) {
   detach();
   (*values_)[slot] = std::move(value);

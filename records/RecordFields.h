@@ -45,7 +45,7 @@ class RecordFields {
 
   Value value(std::size_t slot) const;
   bool isNull(std::size_t slot) const {
-    return values_ ? (*values_)[slot].isNull() : positions_[slot] == kAbsent;
+    return positions_[slot] == kAbsent && (!values_ || (*values_)[slot].isNull());
   }
   // Readings that raise TypeError naming `key`; null stays null. Views live as long as the field.
   OptionalString string(std::size_t slot, std::string_view key) const {
@@ -65,7 +65,9 @@ class RecordFields {
   // Elements of an array; 0 for everything else.
   std::size_t count(std::size_t slot) const;
   // Whether two slots were read from one and the same entry.
-  bool sharesEntry(std::size_t slot, std::size_t other) const;
+  bool sharesEntry(std::size_t slot, std::size_t other) const {
+    return positions_[slot] != kAbsent && positions_[slot] == positions_[other];
+  }
 
   void set(std::size_t slot, Value value);
   // Reads `slot` from the entry of `other` when it has none of its own.

@@ -48,11 +48,6 @@ Number Number::real(double value) {
   return Number(Type::kReal64, std::bit_cast<std::uint64_t>(value));
 }
 
-bool Number::boolValue() const {
-  if (isReal()) return doubleValue() != 0;
-  return bits_ != 0;
-}
-
 std::int64_t Number::int64Value() const {
   if (!isReal()) return static_cast<std::int64_t>(bits_);
   const double value = doubleValue();
