@@ -69,8 +69,9 @@ KXSAssetPtr KXSAsset::initFromPropertyList(const Value& dictionary) {
 }
 
 KXSAssetPtr KXSAsset::initFromPropertyList(Value dictionary,
-                                           const RecordFields::Positions& positions) {
-  return std::make_shared<KXSAsset>(Token(), RecordFields(std::move(dictionary), positions));
+                                           const RecordFields::Positions& positions,
+                                           RecordBlocks& blocks) {
+  return blocks.make<KXSAsset>(Token(), RecordFields(std::move(dictionary), positions));
 }
 
 KXSAssetPtr KXSAsset::initWithCoder(KeyedUnarchiver& coder) {
@@ -119,6 +120,7 @@ Value KXSAsset::propertyList() const {
 
 std::vector<KXSFacePtr> KXSAsset::getFacesArray() const {
   std::vector<KXSFacePtr> faces;
+  if (fields_.isNull(kFaces)) return faces;
   const std::optional<ArrayView> infos = facesInfo();
   if (!infos) return faces;
   faces.reserve(infos->size());
@@ -143,22 +145,13 @@ bool KXSAsset::hasEquivalentFields(const KXSAsset& other) const {
   return fields_.count(kFaces) == other.fields_.count(kFaces);
 }
 
-bool KXSAsset::isVideo() const {
-  const std::optional<Number> number = fields_.number(kIsVideo, kKXSAssetIsVideoKey);
-  return number && number->boolValue();
-}
-
 std::optional<ArrayView> KXSAsset::adjustments() const {
+  if (fields_.isNull(kAdjustments)) return std::nullopt;
   return fields_.value(kAdjustments).asArray(kKXSAssetAdjustmentsKey);
 }
 
-std::optional<Number> KXSAsset::exposureDate() const {
-  const bool isFallback = fields_.sharesEntry(kExposureDate, kModificationDate);
-  return fields_.number(kExposureDate,
-                        isFallback ? kKXSAssetModificationDateKey : kKXSAssetExposureDateKey);
-}
-
 std::optional<ArrayView> KXSAsset::facesInfo() const {
+  if (fields_.isNull(kFaces)) return std::nullopt;
   return fields_.value(kFaces).asArray(kKXSAssetFacesKey);
 }
 

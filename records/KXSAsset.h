@@ -10,6 +10,7 @@
 #include "records/KXSAssetProperties.h"
 #include "records/KXSFace.h"
 #include "records/KXSItem.h"
+#include "records/RecordBlocks.h"
 
 namespace kx {
 
@@ -28,9 +29,10 @@ class KXSAsset final : public KXSItem {
   static KXSAssetPtr initWithUUID(OptionalString uuid);
   // A missing exposure date is the modification date.
   static KXSAssetPtr initFromPropertyList(const Value& dictionary);
-  // The same, with positions found before (RecordLayouts).
+  // The same, with positions found before (RecordLayouts) and in memory of these blocks.
   static KXSAssetPtr initFromPropertyList(Value dictionary,
-                                          const RecordFields::Positions& positions);
+                                          const RecordFields::Positions& positions,
+                                          RecordBlocks& blocks);
   // Dates and location are not archived: they come back null.
   static KXSAssetPtr initWithCoder(KeyedUnarchiver& coder);
   ~KXSAsset() override;
@@ -57,7 +59,10 @@ class KXSAsset final : public KXSItem {
   }
   void setIsFlagged(Value isFlagged) { fields_.set(kIsFlagged, std::move(isFlagged)); }
   // False when absent.
-  bool isVideo() const;
+  bool isVideo() const {
+    const std::optional<Number> number = fields_.number(kIsVideo, kKXSAssetIsVideoKey);
+    return number && number->boolValue();
+  }
   void setIsVideo(bool isVideo) { fields_.set(kIsVideo, Value::boolean(isVideo)); }
   OptionalString caption() const { return fields_.string(kCaption, kKXSAssetCaptionKey); }
   void setCaption(OptionalString caption) { fields_.set(kCaption, Value::optionalString(caption)); }
@@ -65,7 +70,11 @@ class KXSAsset final : public KXSItem {
   void setEventUUID(OptionalString uuid) { fields_.set(kEventUUID, Value::optionalString(uuid)); }
   std::optional<ArrayView> adjustments() const;
   void setAdjustments(Value adjustments) { fields_.set(kAdjustments, std::move(adjustments)); }
-  std::optional<Number> exposureDate() const;
+  std::optional<Number> exposureDate() const {
+    const bool isFallback = fields_.sharesEntry(kExposureDate, kModificationDate);
+    return fields_.number(kExposureDate,
+                          isFallback ? kKXSAssetModificationDateKey : kKXSAssetExposureDateKey);
+  }
   void setExposureDate(Value seconds) { fields_.set(kExposureDate, std::move(seconds)); }
   std::optional<Number> modificationDate() const {
     return fields_.number(kModificationDate, kKXSAssetModificationDateKey);

@@ -46,7 +46,7 @@ std::string_view KXSItem::_itemType() const {
 
 Value KXSItem::uuidValue() const {
   Value uuid = fields_.value(kUUID);
-  uuid.asString(kKXSItemUUIDKey);
+  if (!uuid.isString()) uuid.asString(kKXSItemUUIDKey);  // raises unless it is null
   return uuid;
 }
 

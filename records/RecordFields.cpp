@@ -60,10 +60,6 @@ Value RecordFields::value(std::size_t slot) const {
   return dictionary_.dictionaryValue().valueAt(positions_[slot]);
 }
 
-bool RecordFields::isNull(std::size_t slot) const {
-  return values_ ? (*values_)[slot].isNull() : positions_[slot] == kAbsent;
-}
-
 OptionalString RecordFields::anyString(std::size_t slot, std::string_view key) const {
   if (values_) return (*values_)[slot].asString(key);
   if (positions_[slot] == kAbsent) return std::nullopt;
@@ -84,10 +80,6 @@ std::size_t RecordFields::count(std::size_t slot) const {
   }
   const Value array = value(slot);
   return array.isArray() ? array.arrayValue().size() : 0;
-}
-
-bool RecordFields::sharesEntry(std::size_t slot, std::size_t other) const {
-  return !values_ && positions_[slot] != kAbsent && positions_[slot] == positions_[other];
 }
 
 void RecordFields::set(std::size_t slot, Value value) {

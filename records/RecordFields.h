@@ -44,7 +44,9 @@ class RecordFields {
                             Positions& positions);
 
   Value value(std::size_t slot) const;
-  bool isNull(std::size_t slot) const;
+  bool isNull(std::size_t slot) const {
+    return positions_[slot] == kAbsent && (!values_ || (*values_)[slot].isNull());
+  }
   // Readings that raise TypeError naming `key`; null stays null. Views live as long as the field.
   OptionalString string(std::size_t slot, std::string_view key) const {
     if (canPeek(slot)) {
@@ -63,7 +65,9 @@ class RecordFields {
   // Elements of an array; 0 for everything else.
   std::size_t count(std::size_t slot) const;
   // Whether two slots were read from one and the same entry.
-  bool sharesEntry(std::size_t slot, std::size_t other) const;
+  bool sharesEntry(std::size_t slot, std::size_t other) const {
+    return positions_[slot] != kAbsent && positions_[slot] == positions_[other];
+  }
 
   void set(std::size_t slot, Value value);
   // Reads `slot` from the entry of `other` when it has none of its own.
@@ -78,13 +82,13 @@ class RecordFields {
   using Values = std::array<Value, kSlots>;
   void detach();
   bool canPeek(std::size_t slot) const {
-    return !values_ && positions_[slot] != kAbsent && EntryPeek::can(dictionary_);
+    return positions_[slot] != kAbsent && EntryPeek::canContainer(dictionary_);
   }
   OptionalString anyString(std::size_t slot, std::string_view key) const;
   std::optional<Number> anyNumber(std::size_t slot, std::string_view key) const;
 
-  Value dictionary_;
-  Positions positions_ = kNowhere;
+  Value dictionary_;                // a dictionary, or null
+  Positions positions_ = kNowhere;  // kNowhere when there are values
   std::unique_ptr<Values> values_;  // all fields, once one was set
 };
 

@@ -1,6 +1,7 @@
 #include "transport/KXSTransportDecoder.h"
 
 #include <algorithm>
+#include <array>
 
 #include "platform/foundation/EntryPeek.h"
 #include "platform/foundation/Limits.h"
@@ -39,8 +40,14 @@ ClassifiedItem plainItem(const Value& dictionary) {
   }
 }
 
-ClassifiedItem itemFromPropertyList(Value dictionary, RecordLayouts& layouts) {
-  const RecordLayouts::Layout* layout = layouts.find(dictionary);
+// What serves all items of one decoding.
+struct Making {
+  RecordLayouts layouts;
+  RecordBlocks blocks;
+};
+
+ClassifiedItem itemFromPropertyList(Value dictionary, Making& making) {
+  const RecordLayouts::Layout* layout = making.layouts.find(dictionary);
   if (layout == nullptr) return plainItem(dictionary);
   if (layout->itemType == RecordFields::kAbsent) throw UnknownObjectType();
   const EntryPeek type = EntryPeek::valueOf(dictionary, layout->itemType);
@@ -51,17 +58,17 @@ ClassifiedItem itemFromPropertyList(Value dictionary, RecordLayouts& layouts) {
               KXSAlbum::initFromPropertyList(std::move(dictionary), layout->album)};
     case ItemClass::kAsset:
       return {ItemClass::kAsset,
-              KXSAsset::initFromPropertyList(std::move(dictionary), layout->asset)};
+              KXSAsset::initFromPropertyList(std::move(dictionary), layout->asset, making.blocks)};
     default:
       return {ItemClass::kEvent,
               KXSEvent::initFromPropertyList(std::move(dictionary), layout->event)};
   }
 }
 
-Value keyOf(const KXSItem& item) {
-  Value uuid = item.uuidValue();
-  if (uuid.isNull()) throw InternalInconsistency("item without \"uuid\" cannot be stored");
-  return uuid;
+std::string_view keyOf(const KXSItem& item) {
+  const OptionalString uuid = item.uuid();
+  if (!uuid) throw InternalInconsistency("item without \"uuid\" cannot be stored");
+  return *uuid;
 }
 
 void checkCount(std::size_t count, std::uint64_t limit, std::string_view what) {
@@ -70,21 +77,65 @@ void checkCount(std::size_t count, std::uint64_t limit, std::string_view what) {
                               std::string(what));
 }
 
-// The collections of one snapshot while it is decoded.
+// Inserts assets in their order, each some time after it was added: the map's table is much larger
+// than the processor's caches, and what an insertion needs is fetched meanwhile.
+class AssetQueue {
+ public:
+  explicit AssetQueue(KXSAssetMap& assets) : assets_(assets) {}
+
+  // The key is the asset's.
+  void add(std::string_view key, KXSAssetPtr asset) {
+    __builtin_prefetch(key.data());
+    Waiting& place = step();
+    place.key = key;
+    place.asset = std::move(asset);
+  }
+  // Inserts those that wait. Before this nothing is to be seen or thrown that comes after them.
+  void finish() {
+    for (std::size_t i = 0; i < kMostWaiting; ++i) step();
+  }
+
+ private:
+  struct Waiting {
+    std::string_view key;
+    KXSAssetPtr asset;  // null: free
+    std::uint64_t hash = 0;
+  };
+  static constexpr std::size_t kMostWaiting = 16;
+
+  // Inserts the oldest and gives its place.
+  Waiting& step() {
+    Waiting& middle = waiting_[(steps_ + kMostWaiting / 2) % kMostWaiting];
+    if (middle.asset) middle.hash = assets_.announce(middle.key);
+    Waiting& oldest = waiting_[steps_++ % kMostWaiting];
+    if (oldest.asset) {
+      Value key = oldest.asset->uuidValue();
+      assets_.setHashed(std::move(key), std::move(oldest.asset), oldest.hash);
+      checkCount(assets_.size(), limits::kAssets, "assets");
+    }
+    return oldest;
+  }
+
+  KXSAssetMap& assets_;
+  std::array<Waiting, kMostWaiting> waiting_;
+  std::size_t steps_ = 0;
+};
+
+// The collections of one snapshot.
 struct Collections {
   KXSAssetMapPtr assets = std::make_shared<KXSAssetMap>();
   KXSItemMapPtr containers = std::make_shared<KXSItemMap>();
   KXSItemListPtr ordered = std::make_shared<KXSItemList>();
 
-  void add(ClassifiedItem classified) {
-    Value key = keyOf(*classified.item);
+  void add(ClassifiedItem classified, AssetQueue& queue) {
+    const std::string_view key = keyOf(*classified.item);
     if (classified.itemClass == ItemClass::kAsset) {
-      assets->set(std::move(key), std::static_pointer_cast<KXSAsset>(std::move(classified.item)));
-      checkCount(assets->size(), limits::kAssets, "assets");
+      queue.add(key, std::static_pointer_cast<KXSAsset>(std::move(classified.item)));
       return;
     }
     ordered->push_back(classified.item);
-    containers->set(std::move(key), std::move(classified.item));
+    Value keptKey = classified.item->uuidValue();
+    containers->set(std::move(keptKey), std::move(classified.item));
     checkCount(ordered->size(), limits::kContainers, "albums and events");
   }
 };
@@ -92,26 +143,35 @@ struct Collections {
 // A list can name one item very often: more room than this is made as it is needed.
 constexpr std::size_t kMostReserved = std::size_t{1} << 17;
 
-Collections decodeUpdates(const Value& root, RecordLayouts& layouts) {
+Collections decodeUpdates(const Value& root, Making& making) {
   Collections collections;
   const auto updates = root[kKXSTransportUpdatesKey].asArray(kKXSTransportUpdatesKey);
   if (!updates) return collections;
   const std::size_t count = updates->size();
   collections.assets->reserve(std::min(count, kMostReserved));
-  for (std::size_t i = 0; i < count; ++i) {
-    collections.add(itemFromPropertyList((*updates)[i], layouts));
+  AssetQueue queue(*collections.assets);
+  try {
+    for (std::size_t i = 0; i < count; ++i) {
+      updates->prefetchBehind(i);
+      collections.add(itemFromPropertyList((*updates)[i], making), queue);
+    }
+  } catch (...) {
+    queue.finish();  // the first item that cannot be stored is the one that counts
+    throw;
   }
+  queue.finish();
   return collections;
 }
 
-KXSItemMapPtr decodeDeletes(const Value& root, RecordLayouts& layouts) {
+KXSItemMapPtr decodeDeletes(const Value& root, Making& making) {
   auto items = std::make_shared<KXSItemMap>();
   const auto deletes = root[kKXSTransportDeletesKey].asArray(kKXSTransportDeletesKey);
   if (!deletes) return items;
   const std::size_t count = deletes->size();
   for (std::size_t i = 0; i < count; ++i) {
-    KXSItemPtr item = itemFromPropertyList((*deletes)[i], layouts).item;
-    Value key = keyOf(*item);
+    KXSItemPtr item = itemFromPropertyList((*deletes)[i], making).item;
+    keyOf(*item);
+    Value key = item->uuidValue();
     items->set(std::move(key), std::move(item));
     checkCount(items->size(), limits::kAssets + limits::kContainers, "deletes");
   }
@@ -173,13 +233,13 @@ KXSLibraryChangeSnapshotPtr KXSTransportDecoder::decodeSnapshotFromPropertyList(
   snapshot->setLibraryKindValue(kind);
   snapshot->setIsFolderSync(kind.isString() &&
                             kind.stringValue() == kKXSTransportLibraryKindFolderKey);
-  RecordLayouts layouts;
-  Collections collections = decodeUpdates(root, layouts);
+  Making making;
+  Collections collections = decodeUpdates(root, making);
   snapshot->setAssetsByUUID(std::move(collections.assets));
   snapshot->setAlbumsAndEventsByUUID(std::move(collections.containers));
   snapshot->setOrderedAlbums(std::move(collections.ordered));
   snapshot->setUpdates(nullptr);
-  snapshot->setDeletes(decodeDeletes(root, layouts));
+  snapshot->setDeletes(decodeDeletes(root, making));
   if (snapshot->isFolderSync()) {
     snapshot->setOrderedAlbums(sortedByName(*snapshot->orderedAlbums()));
   }

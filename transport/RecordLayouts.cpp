@@ -27,22 +27,26 @@ RecordLayouts::Layout layoutOf(const DictionaryView& view) {
 const RecordLayouts::Layout* RecordLayouts::find(const Value& dictionary) {
   if (!dictionary.isDictionary() || !EntryPeek::can(dictionary)) return nullptr;
   if (EntryPeek::document(dictionary) != document_) {
-    layouts_.clear();
-    last_ = nullptr;
+    forget();
     document_ = EntryPeek::document(dictionary);
   }
+  const std::size_t count = EntryPeek::count(dictionary);
+  if (count > kMostKeys) return nullptr;
   const std::string_view keys = EntryPeek::keyBytes(dictionary);
-  if (last_ != nullptr && keys == lastKeys_) return last_;
+  Last& last = last_[count];
+  if (last.layout != nullptr && keys == last.keys) return last.layout;
   auto found = layouts_.find(keys);
   if (found == layouts_.end()) {
-    const DictionaryView view = dictionary.dictionaryValue();
-    if (view.size() > kMostKeys) return nullptr;
-    if (layouts_.size() == kMostLayouts) layouts_.clear();
-    found = layouts_.emplace(keys, layoutOf(view)).first;
+    if (layouts_.size() == kMostLayouts) forget();
+    found = layouts_.emplace(keys, layoutOf(dictionary.dictionaryValue())).first;
   }
-  lastKeys_ = found->first;
-  last_ = &found->second;
-  return last_;
+  last_[count] = {found->first, &found->second};
+  return &found->second;
+}
+
+void RecordLayouts::forget() {
+  layouts_.clear();
+  last_.fill(Last());
 }
 
 }  // namespace kx

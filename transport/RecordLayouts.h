@@ -1,5 +1,6 @@
 #pragma once
 
+#include <array>
 #include <cstddef>
 #include <cstdint>
 #include <string>
@@ -39,10 +40,16 @@ class RecordLayouts {
     }
   };
 
+  void forget();
+
   const void* document_ = nullptr;
   std::unordered_map<std::string, Layout, Hash, std::equal_to<>> layouts_;
-  std::string_view lastKeys_;  // views a key of layouts_
-  const Layout* last_ = nullptr;
+  // The layout met last among those with so many keys.
+  struct Last {
+    std::string_view keys;  // views a key of layouts_
+    const Layout* layout = nullptr;
+  };
+  std::array<Last, kMostKeys + 1> last_;
 };
 
 }  // namespace kx

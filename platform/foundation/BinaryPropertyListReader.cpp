@@ -55,16 +55,17 @@ void BinaryPropertyListReader::failExpansion(std::uint64_t offset) const {
 // The keys and indexes that lead from the root to the value at which the walk stands.
 std::string BinaryPropertyListReader::path() const {
   std::string result;
-  for (const Frame& frame : stack_) {
+  for (std::size_t i = 0; i < depth_; ++i) {
+    const Frame& frame = stack_[i];
     if (frame.next == 0) continue;
     const std::uint32_t position = frame.next - 1;
     if (nodes_[frame.object].kind == Kind::kArray) {
       result += '[' + std::to_string(position) + ']';
       continue;
     }
-    const DocumentNode& key = nodes_[document_->reference(nodes_[frame.object], position)];
+    const std::uint32_t key = document_->reference(nodes_[frame.object].low, position);
     if (!result.empty()) result += '.';
-    result += escapeControlCharacters(document_->text(key));
+    result += escapeControlCharacters(document_->text(nodes_[key]));
   }
   return result;
 }
@@ -73,8 +74,11 @@ Value BinaryPropertyListReader::read() {
   readTrailer();
   document_->count_ = count_;
   document_->referenceSize_ = referenceSize_;
-  document_->nodes_ = makeLazyArray<DocumentNode>(count_);
+  document_->referenceShift_ = referenceShift_;
+  // Every node is written before it is read: the walk and readUnreferenced() meet every object.
+  document_->nodes_ = makeRawArray<DocumentNode>(count_);
   nodes_ = document_->nodes_.get();
+  states_ = makeLazyArray<State>(count_);
   walk(root_);
   readUnreferenced();
   document_->indexLargeDictionaries(largeDictionaries_);
@@ -98,6 +102,8 @@ void BinaryPropertyListReader::readTrailer() {
     fail(PropertyListError::kTrailer, "reference size " + std::to_string(referenceSize_),
          trailer + 7);
   }
+  offsetShift_ = PropertyListDocument::shiftOf(offsetSize_);
+  referenceShift_ = PropertyListDocument::shiftOf(referenceSize_);
   const auto field = [&](std::size_t at) {
     return PropertyListDocument::loadBig(base_ + trailer + at, 8);
   };
@@ -128,15 +134,16 @@ void BinaryPropertyListReader::readTrailer() {
   count_ = static_cast<std::uint32_t>(count);
   root_ = static_cast<std::uint32_t>(root);
   tableStart_ = static_cast<std::size_t>(table);
+  unclaimed_ = tableStart_ - kHeaderBytes;
 }
 
 // Nothing reaches these objects, but the file is checked whole.
 void BinaryPropertyListReader::readUnreferenced() {
-  if (readCount_ == count_) return;
-  for (std::uint32_t object = 0; object < count_; ++object) {
-    DocumentNode& node = nodes_[object];
-    if (node.kind != Kind::kNull) continue;
+  const State* const end = states_.get() + count_;
+  for (const State* at = states_.get(); (at = std::find(at, end, kUnread)) != end;) {
+    const auto object = static_cast<std::uint32_t>(at - states_.get());
     readObject(object);
+    const DocumentNode& node = nodes_[object];
     const bool isDictionary = node.kind == Kind::kDictionary;
     if (!isDictionary && node.kind != Kind::kArray) continue;
     const std::size_t references = std::size_t{node.high} * (isDictionary ? 2 : 1);

@@ -19,26 +19,33 @@ std::string hex(unsigned byte) {
   return {'0', 'x', kDigits[byte >> 4 & 15], kDigits[byte & 15]};
 }
 
-// Where the first byte stands that is NUL or not ASCII, or the length. 8 bytes are tested at once;
-// at least 8 bytes must be readable behind the text.
-std::size_t asciiPrefix(const std::uint8_t* text, std::size_t length) {
-  constexpr std::uint64_t kOnes = 0x0101010101010101U;
+constexpr std::uint64_t kOnes = 0x0101010101010101U;
+
+bool isBadAscii(std::uint8_t byte) { return byte == 0 || byte >= 0x80; }
+
+// Whether no byte is NUL or above ASCII. 8 bytes are tested at once; at least 8 bytes must be
+// readable behind the text.
+[[gnu::always_inline]] inline bool isGoodAscii(const std::uint8_t* text, std::size_t length) {
   constexpr std::uint64_t kHigh = 0x8080808080808080U;
-  const auto isBad = [](std::uint64_t word) { return (((word - kOnes) | word) & kHigh) != 0; };
-  std::size_t at = 0;
+  std::uint64_t bad = 0;
   std::uint64_t word = 0;
-  for (; at + 8 <= length; at += 8) {
-    std::memcpy(&word, text + at, 8);
-    if (isBad(word)) break;
+  for (; length >= 16; text += 16, length -= 16) {
+    std::uint64_t more = 0;
+    std::memcpy(&word, text, 8);
+    std::memcpy(&more, text + 8, 8);
+    bad |= (word - kOnes) | word | (more - kOnes) | more;
   }
-  if (at + 8 > length) {
-    if (at == length) return length;
-    std::memcpy(&word, text + at, 8);
-    const std::uint64_t mask = (std::uint64_t{1} << (8 * (length - at))) - 1;
-    if (!isBad((word & mask) | (kOnes & ~mask))) return length;
+  if (length >= 8) {
+    std::memcpy(&word, text, 8);
+    bad |= (word - kOnes) | word;
+    text += 8;
+    length -= 8;
   }
-  while (at < length && text[at] != 0 && text[at] < 0x80) ++at;
-  return at;
+  std::memcpy(&word, text, 8);
+  const std::uint64_t mask = (std::uint64_t{1} << (8 * length)) - 1;
+  word = (word & mask) | (kOnes & ~mask);
+  bad |= (word - kOnes) | word;
+  return (bad & kHigh) == 0;
 }
 
 unsigned loadUnit(const std::uint8_t* from) {
@@ -47,54 +54,142 @@ unsigned loadUnit(const std::uint8_t* from) {
 
 }  // namespace
 
-void BinaryPropertyListReader::claim(std::size_t offset, std::size_t end) {
-  claimed_ += end - offset;
-  if (claimed_ > tableStart_ - kHeaderBytes) {
-    fail(PropertyListError::kOffset, "objects overlap", offset);
-  }
+[[gnu::always_inline]] inline void BinaryPropertyListReader::claim(std::size_t offset,
+                                                                   std::size_t bytes) {
+  if (bytes > unclaimed_) failOverlap(offset);
+  unclaimed_ -= bytes;
 }
 
-void BinaryPropertyListReader::requireFixed(std::size_t offset, std::size_t size) {
-  if (tableStart_ - offset < 1 + size) {
-    fail(PropertyListError::kOffset, "an object runs into the offset table", offset);
-  }
-  claim(offset, offset + 1 + size);
+[[gnu::always_inline]] inline void BinaryPropertyListReader::requireFixed(std::size_t offset,
+                                                                          std::size_t size) {
+  if (tableStart_ - offset < 1 + size) failEnd(offset);
+  claim(offset, 1 + size);
 }
 
-void BinaryPropertyListReader::readObject(std::uint32_t object) {
+void BinaryPropertyListReader::failOverlap(std::size_t offset) const {
+  fail(PropertyListError::kOffset, "objects overlap", offset);
+}
+
+void BinaryPropertyListReader::failEnd(std::size_t offset) const {
+  fail(PropertyListError::kOffset, "an object runs into the offset table", offset);
+}
+
+void BinaryPropertyListReader::failLength(std::uint64_t count, std::size_t offset) const {
+  fail(PropertyListError::kLength,
+       "a length of " + std::to_string(count) + " exceeds the bytes left", offset);
+}
+
+void BinaryPropertyListReader::failPlace(std::uint32_t object, std::uint64_t place) const {
+  fail(PropertyListError::kOffset,
+       "object " + std::to_string(object) + " stands at " + std::to_string(place),
+       tableStart_ + std::size_t{object} * offsetSize_);
+}
+
+void BinaryPropertyListReader::failStringLength(std::size_t offset) const {
+  fail(PropertyListError::kLimit,
+       "a string is longer than " + std::to_string(limits_.stringBytes) + " bytes", offset);
+}
+
+void BinaryPropertyListReader::failAscii(std::size_t offset, std::size_t length) const {
+  const std::uint8_t* const bad = std::find_if(base_ + offset, base_ + offset + length, isBadAscii);
+  fail(PropertyListError::kTextEncoding, "an ASCII string holds the byte " + hex(*bad),
+       static_cast<std::uint64_t>(bad - base_));
+}
+
+// A length that is an integer of its own.
+BinaryPropertyListReader::Length BinaryPropertyListReader::readLongLength(
+    std::size_t offset) const {
+  Length length{0, offset + 1};
+  const std::size_t left = tableStart_ - length.contentOffset;
+  const unsigned sizeMarker = left == 0 ? 0 : base_[length.contentOffset];
+  if (left == 0 || sizeMarker < 0x10 || sizeMarker > 0x13) {
+    fail(PropertyListError::kLength, "a length is no integer", length.contentOffset);
+  }
+  const unsigned size = 1U << (sizeMarker & 0xF);
+  if (left < 1 + size) {
+    fail(PropertyListError::kLength, "a length is cut", length.contentOffset);
+  }
+  length.count = PropertyListDocument::loadBig(base_ + length.contentOffset + 1, size);
+  if (size == 8 && length.count >> 63 != 0) {
+    fail(PropertyListError::kLength, "a length is negative", length.contentOffset);
+  }
+  length.contentOffset += 1 + size;
+  return length;
+}
+
+// Reads a length and checks it against the bytes left before the table, each unit taking
+// `unitBytes`.
+[[gnu::always_inline]] inline BinaryPropertyListReader::Length BinaryPropertyListReader::readLength(
+    std::size_t offset, unsigned marker, unsigned unitBytes) {
+  Length length{marker & 0xF, offset + 1};
+  if (length.count == 0xF) {
+    // Most lengths of their own have one byte; what is read here lies before the end of the file.
+    length = base_[offset + 1] == 0x10 && offset + 2 < tableStart_
+                 ? Length{base_[offset + 2], offset + 3}
+                 : readLongLength(offset);
+  }
+  std::uint64_t bytes = 0;
+  if (__builtin_mul_overflow(length.count, std::uint64_t{unitBytes}, &bytes) ||
+      bytes > tableStart_ - length.contentOffset) {
+    failLength(length.count, offset);
+  }
+  claim(offset, length.contentOffset + static_cast<std::size_t>(bytes) - offset);
+  return length;
+}
+
+[[gnu::always_inline]] inline void BinaryPropertyListReader::readAscii(DocumentNode& node,
+                                                                       std::size_t offset,
+                                                                       unsigned marker) {
+  const Length length = readLength(offset, marker, 1);
+  if (length.count > limits_.stringBytes) failStringLength(offset);
+  const auto count = static_cast<std::size_t>(length.count);
+  if (!isGoodAscii(base_ + length.contentOffset, count)) failAscii(length.contentOffset, count);
+  node = {static_cast<std::uint32_t>(length.contentOffset), static_cast<std::uint32_t>(count), 0,
+          Kind::kString, DocumentNode::kInFile};
+}
+
+[[gnu::always_inline]] inline void BinaryPropertyListReader::readContainer(DocumentNode& node,
+                                                                           std::size_t offset,
+                                                                           unsigned marker) {
+  const bool isDictionary = marker >> 4 == 0xD;
+  const Length length = readLength(offset, marker, referenceSize_ * (isDictionary ? 2 : 1));
+  node = {static_cast<std::uint32_t>(length.contentOffset),
+          static_cast<std::uint32_t>(length.count), 0,
+          isDictionary ? Kind::kDictionary : Kind::kArray, 0};
+}
+
+// What there is most of stands here, the rest elsewhere.
+[[gnu::always_inline]] inline void BinaryPropertyListReader::readObjectInLine(
+    std::uint32_t object) {
   const std::uint64_t place = offsetOf(object);
-  if (place < kHeaderBytes || place >= tableStart_) {
-    fail(PropertyListError::kOffset,
-         "object " + std::to_string(object) + " stands at " + std::to_string(place),
-         tableStart_ + std::size_t{object} * offsetSize_);
-  }
-  ++readCount_;
+  if (place < kHeaderBytes || place >= tableStart_) failPlace(object, place);
+  states_[object] = kRead;
   const auto offset = static_cast<std::size_t>(place);
   DocumentNode& node = nodes_[object];
   const unsigned marker = base_[offset];
-  switch (marker >> 4) {
-    case 0x4:
-      return readData(node, offset, marker);
-    case 0x5:
-      return readAscii(node, offset, marker);
-    case 0x6:
-      return readUtf16(node, offset, marker);
-    case 0xA:
-    case 0xD:
-      return readContainer(node, offset, marker);
-    default:
-      return readScalar(node, offset, marker);
+  if (marker >> 4 == 0x5) {
+    readAscii(node, offset, marker);
+  } else if (marker == 0x23) {
+    requireFixed(offset, 8);
+    node = {0, 0, 0, Kind::kNumber, static_cast<std::uint8_t>(Number::Type::kReal64)};
+    node.setBits(PropertyListDocument::loadBig(base_ + offset + 1, 8));
+  } else if (marker >> 4 == 0xD || marker >> 4 == 0xA) {
+    readContainer(node, offset, marker);
+  } else {
+    readRare(node, offset, marker);
   }
 }
 
-void BinaryPropertyListReader::readScalar(DocumentNode& node, std::size_t offset, unsigned marker) {
+void BinaryPropertyListReader::readObject(std::uint32_t object) { readObjectInLine(object); }
+
+void BinaryPropertyListReader::readRare(DocumentNode& node, std::size_t offset, unsigned marker) {
+  node = {0, 0, 0, Kind::kNumber, 0};
   switch (marker) {
     case 0x08:
     case 0x09:
       requireFixed(offset, 0);
       node.detail = static_cast<std::uint8_t>(Number::Type::kBoolean);
       node.low = marker & 1;
-      node.kind = Kind::kNumber;
       return;
     case 0x22: {
       requireFixed(offset, 4);
@@ -102,46 +197,42 @@ void BinaryPropertyListReader::readScalar(DocumentNode& node, std::size_t offset
           static_cast<std::uint32_t>(PropertyListDocument::loadBig(base_ + offset + 1, 4));
       node.detail = static_cast<std::uint8_t>(Number::Type::kReal32);
       node.setBits(ValueAccess::numberBits(Number::real32(std::bit_cast<float>(raw))));
-      node.kind = Kind::kNumber;
       return;
     }
-    case 0x23:
-      requireFixed(offset, 8);
-      node.detail = static_cast<std::uint8_t>(Number::Type::kReal64);
-      node.setBits(PropertyListDocument::loadBig(base_ + offset + 1, 8));
-      node.kind = Kind::kNumber;
-      return;
     case 0x33:
       return readDate(node, offset);
     default:
       break;
   }
   if (marker >= 0x10 && marker <= 0x14) return readInteger(node, offset, marker);
-  if (marker >> 4 == 0x8) return readUid(node, offset, marker);
-  fail(PropertyListError::kMarker, "unknown marker " + hex(marker), offset);
+  switch (marker >> 4) {
+    case 0x4:
+      return readData(node, offset, marker);
+    case 0x6:
+      return readUtf16(node, offset, marker);
+    case 0x8:
+      return readUid(node, offset, marker);
+    default:
+      fail(PropertyListError::kMarker, "unknown marker " + hex(marker), offset);
+  }
 }
 
+// 16 bytes hold what exceeds a signed 64-bit integer; larger values have no type here.
 void BinaryPropertyListReader::readInteger(DocumentNode& node, std::size_t offset,
                                            unsigned marker) {
   const unsigned size = 1U << (marker & 0xF);
   requireFixed(offset, size);
-  node.kind = Kind::kNumber;
-  if (size == 16) return readWideInteger(node, offset);
   node.detail = static_cast<std::uint8_t>(Number::Type::kInteger);
-  node.setBits(PropertyListDocument::loadBig(base_ + offset + 1, size));
-}
-
-// 16 bytes hold what exceeds a signed 64-bit integer; larger values have no type here.
-void BinaryPropertyListReader::readWideInteger(DocumentNode& node, std::size_t offset) {
+  if (size < 16) return node.setBits(PropertyListDocument::loadBig(base_ + offset + 1, size));
   const std::uint64_t high = PropertyListDocument::loadBig(base_ + offset + 1, 8);
   const std::uint64_t low = PropertyListDocument::loadBig(base_ + offset + 9, 8);
   const bool isNegative = high == ~std::uint64_t{0} && low >> 63 != 0;
   if (high != 0 && !isNegative) {
     fail(PropertyListError::kRange, "an integer exceeds 64 bits", offset);
   }
-  const bool isUnsigned = !isNegative && low >> 63 != 0;
-  node.detail =
-      static_cast<std::uint8_t>(isUnsigned ? Number::Type::kUnsigned : Number::Type::kInteger);
+  if (!isNegative && low >> 63 != 0) {
+    node.detail = static_cast<std::uint8_t>(Number::Type::kUnsigned);
+  }
   node.setBits(low);
 }
 
@@ -168,75 +259,20 @@ void BinaryPropertyListReader::readUid(DocumentNode& node, std::size_t offset, u
   node.kind = Kind::kUid;
 }
 
-// Reads a length and checks it against the bytes left before the table, each unit taking
-// `unitBytes`.
-BinaryPropertyListReader::Length BinaryPropertyListReader::readLength(std::size_t offset,
-                                                                      unsigned marker,
-                                                                      unsigned unitBytes) {
-  Length length{marker & 0xF, offset + 1};
-  if (length.count == 0xF) {
-    const std::size_t left = tableStart_ - length.contentOffset;
-    const unsigned sizeMarker = left == 0 ? 0 : base_[length.contentOffset];
-    if (left == 0 || sizeMarker < 0x10 || sizeMarker > 0x13) {
-      fail(PropertyListError::kLength, "a length is no integer", length.contentOffset);
-    }
-    const unsigned size = 1U << (sizeMarker & 0xF);
-    if (left < 1 + size) {
-      fail(PropertyListError::kLength, "a length is cut", length.contentOffset);
-    }
-    length.count = PropertyListDocument::loadBig(base_ + length.contentOffset + 1, size);
-    if (size == 8 && length.count >> 63 != 0) {
-      fail(PropertyListError::kLength, "a length is negative", length.contentOffset);
-    }
-    length.contentOffset += 1 + size;
-  }
-  if (length.count > (tableStart_ - length.contentOffset) / unitBytes) {
-    fail(PropertyListError::kLength,
-         "a length of " + std::to_string(length.count) + " exceeds the bytes left", offset);
-  }
-  claim(offset, length.contentOffset + static_cast<std::size_t>(length.count) * unitBytes);
-  return length;
-}
-
 void BinaryPropertyListReader::readData(DocumentNode& node, std::size_t offset, unsigned marker) {
   const Length length = readLength(offset, marker, 1);
   if (length.count > limits_.dataBytes) {
     fail(PropertyListError::kLimit,
          "data is longer than " + std::to_string(limits_.dataBytes) + " bytes", offset);
   }
-  node.low = static_cast<std::uint32_t>(length.contentOffset);
-  node.high = static_cast<std::uint32_t>(length.count);
-  node.detail = DocumentNode::kInFile;
-  node.kind = Kind::kData;
-}
-
-void BinaryPropertyListReader::readAscii(DocumentNode& node, std::size_t offset, unsigned marker) {
-  const Length length = readLength(offset, marker, 1);
-  if (length.count > limits_.stringBytes) {
-    fail(PropertyListError::kLimit,
-         "a string is longer than " + std::to_string(limits_.stringBytes) + " bytes", offset);
-  }
-  const auto count = static_cast<std::size_t>(length.count);
-  const std::size_t good = asciiPrefix(base_ + length.contentOffset, count);
-  if (good != count) {
-    fail(PropertyListError::kTextEncoding,
-         "an ASCII string holds the byte " + hex(base_[length.contentOffset + good]),
-         length.contentOffset + good);
-  }
-  node.low = static_cast<std::uint32_t>(length.contentOffset);
-  node.high = static_cast<std::uint32_t>(count);
-  node.detail = DocumentNode::kInFile;
-  node.kind = Kind::kString;
+  node = {static_cast<std::uint32_t>(length.contentOffset),
+          static_cast<std::uint32_t>(length.count), 0, Kind::kData, DocumentNode::kInFile};
 }
 
 void BinaryPropertyListReader::readUtf16(DocumentNode& node, std::size_t offset, unsigned marker) {
   const Length length = readLength(offset, marker, 2);
   const auto units = static_cast<std::size_t>(length.count);
-  const auto tooLong = [&] {
-    fail(PropertyListError::kLimit,
-         "a string is longer than " + std::to_string(limits_.stringBytes) + " bytes", offset);
-  };
-  if (units > limits_.stringBytes) tooLong();
+  if (units > limits_.stringBytes) failStringLength(offset);
   DocumentArena& arena = document_->arena_;
   char* const out = arena.begin(units * 3, length_ / 2 * 3);
   if (out == nullptr) {
@@ -258,29 +294,17 @@ void BinaryPropertyListReader::readUtf16(DocumentNode& node, std::size_t offset,
     }
     written += encodeUtf8(point, out + written);
   }
-  if (written > limits_.stringBytes) tooLong();
-  node.low = arena.commit(written);
-  node.high = static_cast<std::uint32_t>(written);
-  node.detail = DocumentNode::kInArena;
-  node.kind = Kind::kString;
-}
-
-void BinaryPropertyListReader::readContainer(DocumentNode& node, std::size_t offset,
-                                             unsigned marker) {
-  const bool isDictionary = marker >> 4 == 0xD;
-  const Length length = readLength(offset, marker, referenceSize_ * (isDictionary ? 2 : 1));
-  node.low = static_cast<std::uint32_t>(length.contentOffset);
-  node.high = static_cast<std::uint32_t>(length.count);
-  node.kind = isDictionary ? Kind::kDictionary : Kind::kArray;
+  if (written > limits_.stringBytes) failStringLength(offset);
+  node = {arena.commit(written), static_cast<std::uint32_t>(written), 0, Kind::kString,
+          DocumentNode::kInArena};
 }
 
 void BinaryPropertyListReader::walk(std::uint32_t root) {
-  stack_.reserve(limits_.nestingDepth);
   readObject(root);
   if (nodes_[root].kind != Kind::kArray && nodes_[root].kind != Kind::kDictionary) return;
   enter(root);
-  while (!stack_.empty()) {
-    Frame& frame = stack_.back();
+  while (depth_ != 0) {
+    Frame& frame = stack_[depth_ - 1];
     if (frame.next == frame.count) {
       leave();
     } else {
@@ -289,22 +313,21 @@ void BinaryPropertyListReader::walk(std::uint32_t root) {
   }
 }
 
-void BinaryPropertyListReader::enter(std::uint32_t object) {
-  DocumentNode& node = nodes_[object];
-  if (stack_.size() >= limits_.nestingDepth) {
+inline void BinaryPropertyListReader::enter(std::uint32_t object) {
+  if (depth_ >= limits_.nestingDepth) {
     failDepth(offsetOf(object));
   }
-  node.state = DocumentNode::kGrey;
+  states_[object] = kOpen;
+  const DocumentNode& node = nodes_[object];
   const bool isDictionary = node.kind == Kind::kDictionary;
-  const std::size_t keyBytes = isDictionary ? std::size_t{node.high} * referenceSize_ : 0;
-  const std::uint64_t visits = 1 + (isDictionary ? std::uint64_t{node.high} : 0);
-  stack_.push_back(Frame{object, 0, node.high, static_cast<std::uint32_t>(visits),
-                         base_ + node.low + keyBytes, 0});
-  if (isDictionary) checkKeys(stack_.back());
+  const std::uint32_t keys = isDictionary ? node.high : 0;
+  stack_[depth_++] = {
+      object, 0, node.high, 1 + keys, base_ + node.low + std::size_t{keys} * referenceSize_, 0};
+  if (isDictionary) checkKeys(object);
 }
 
-void BinaryPropertyListReader::checkKeys(const Frame& frame) {
-  const DocumentNode& node = nodes_[frame.object];
+inline void BinaryPropertyListReader::checkKeys(std::uint32_t object) {
+  const DocumentNode& node = nodes_[object];
   const std::uint8_t* place = base_ + node.low;
   const bool isSmall = node.high <= PropertyListDocument::kScanLimit;
   if (isSmall) {
@@ -313,88 +336,98 @@ void BinaryPropertyListReader::checkKeys(const Frame& frame) {
     if (good != nullptr && std::memcmp(good, place, keyBytes) == 0) return;
   }
   for (std::uint32_t i = 0; i < node.high; ++i, place += referenceSize_) {
-    const std::uint32_t object = referenceAt(place);
-    DocumentNode& key = nodes_[object];
-    if (key.kind == Kind::kNull) readObject(object);
-    const auto offset = static_cast<std::uint64_t>(place - base_);
-    if (key.kind != Kind::kString) {
-      fail(PropertyListError::kKeyType, "a key is a " + std::string(kindName(key.kind)), offset);
-    }
-    if (key.extra == 0) {
-      const std::string_view text = document_->text(key);
-      if (text.size() > limits_.keyUnits && utf16Length(text) > limits_.keyUnits) {
-        fail(PropertyListError::kLimit,
-             "a key is longer than " + std::to_string(limits_.keyUnits) + " units", offset);
-      }
-      const std::uint32_t number = document_->internKey(object);
-      if (number == lastDictionaryOfKey_.size()) lastDictionaryOfKey_.push_back(0);
-    }
-    std::uint32_t& last = lastDictionaryOfKey_[key.extra - 1];
-    if (last == frame.object + 1) {
+    std::uint32_t& last = lastDictionaryOfKey_[readKey(place)];
+    if (last == object + 1) {
+      const std::string_view text = document_->text(nodes_[referenceAt(place)]);
       fail(PropertyListError::kDupKey,
-           "the key \"" + escapeControlCharacters(document_->text(key)) + "\" occurs twice",
-           offset);
+           "the key \"" + escapeControlCharacters(text) + "\" occurs twice",
+           static_cast<std::uint64_t>(place - base_));
     }
-    last = frame.object + 1;
+    last = object + 1;
   }
   if (isSmall) {
     goodKeys_[node.high] = base_ + node.low;
   } else {
-    largeDictionaries_.push_back(frame.object);
+    largeDictionaries_.push_back(object);
   }
+}
+
+std::uint32_t BinaryPropertyListReader::readKey(const std::uint8_t* place) {
+  const std::uint32_t object = referenceAt(place);
+  if (states_[object] == kUnread) readObject(object);
+  const DocumentNode& key = nodes_[object];
+  const auto offset = static_cast<std::uint64_t>(place - base_);
+  if (key.kind != Kind::kString) {
+    fail(PropertyListError::kKeyType, "a key is a " + std::string(kindName(key.kind)), offset);
+  }
+  if (key.extra != 0) return key.extra - 1;
+  const std::string_view text = document_->text(key);
+  if (text.size() > limits_.keyUnits && utf16Length(text) > limits_.keyUnits) {
+    fail(PropertyListError::kLimit,
+         "a key is longer than " + std::to_string(limits_.keyUnits) + " units", offset);
+  }
+  const std::uint32_t number = document_->internKey(object);
+  if (number == lastDictionaryOfKey_.size()) lastDictionaryOfKey_.push_back(0);
+  return number;
 }
 
 // Goes over elements up to the next container that has to be entered, or to the end.
 void BinaryPropertyListReader::advance(Frame& frame) {
-  const std::uint8_t* place = frame.values + std::size_t{frame.next} * referenceSize_;
-  while (frame.next < frame.count) {
-    ++frame.next;
+  const unsigned size = referenceSize_;
+  const std::uint32_t count = frame.count;
+  const std::uint8_t* place = frame.values + std::size_t{frame.next} * size;
+  std::uint32_t scalars = 0;
+  for (std::uint32_t next = frame.next; next < count; place += size) {
+    frame.next = ++next;  // where path() looks
     const std::uint32_t object = referenceAt(place);
-    DocumentNode& node = nodes_[object];
-    if (node.kind == Kind::kNull) readObject(object);
-    if (node.kind == Kind::kArray || node.kind == Kind::kDictionary) {
-      visitContainer(frame, object, place);
-      return;
+    const State state = states_[object];
+    if (state == kUnread) {
+      readObjectInLine(object);
+      const Kind kind = nodes_[object].kind;
+      if (kind == Kind::kArray || kind == Kind::kDictionary) {
+        frame.visits += scalars;
+        return enter(object);
+      }
+    } else if (state != kRead) {
+      frame.visits += scalars;
+      scalars = 0;
+      visitAgain(frame, object, place);
+      continue;
     }
-    ++frame.visits;
-    place += referenceSize_;
+    ++scalars;
   }
+  frame.visits += scalars;
 }
 
-void BinaryPropertyListReader::visitContainer(Frame& frame, std::uint32_t object,
-                                              const std::uint8_t* place) {
-  const DocumentNode& node = nodes_[object];
-  if (node.state == DocumentNode::kWhite) {
-    enter(object);
-    return;
-  }
+// A container that has been entered before.
+void BinaryPropertyListReader::visitAgain(Frame& frame, std::uint32_t object,
+                                          const std::uint8_t* place) {
   const auto offset = static_cast<std::uint64_t>(place - base_);
-  if (node.state == DocumentNode::kGrey) {
+  if (states_[object] == kOpen) {
     fail(PropertyListError::kCycle, "object " + std::to_string(object) + " holds itself", offset);
   }
-  if (stack_.size() + node.height > limits_.nestingDepth) {
+  const auto height = static_cast<std::uint8_t>(states_[object] - kWalked);
+  if (depth_ + height > limits_.nestingDepth) {
     failDepth(offset);
   }
-  frame.height = std::max(frame.height, node.height);
-  frame.visits += node.extra;
+  frame.height = std::max(frame.height, height);
+  frame.visits += nodes_[object].extra;
   if (frame.visits > limits_.visits) {
     failExpansion(offset);
   }
 }
 
-void BinaryPropertyListReader::leave() {
-  const Frame frame = stack_.back();
+inline void BinaryPropertyListReader::leave() {
+  const Frame& frame = stack_[depth_ - 1];
   if (frame.visits > limits_.visits) {
     failExpansion(offsetOf(frame.object));
   }
-  DocumentNode& node = nodes_[frame.object];
-  node.state = DocumentNode::kBlack;
-  node.height = static_cast<std::uint8_t>(frame.height + 1);
-  node.extra = frame.visits;
-  stack_.pop_back();
-  if (stack_.empty()) return;
-  Frame& parent = stack_.back();
-  parent.height = std::max(parent.height, node.height);
+  const auto height = static_cast<std::uint8_t>(frame.height + 1);
+  states_[frame.object] = static_cast<State>(kWalked + height);
+  nodes_[frame.object].extra = frame.visits;
+  if (--depth_ == 0) return;
+  Frame& parent = stack_[depth_ - 1];
+  parent.height = std::max(parent.height, height);
   parent.visits += frame.visits;
   if (parent.visits > limits_.visits) {
     failExpansion(offsetOf(frame.object));

@@ -20,7 +20,7 @@ constexpr std::size_t kTrailerBytes = 32;
 // One object of the file to be. Text, data and storage are borrowed from the root value.
 struct Object {
   const void* pointer;  // text, data; container: its storage
-  std::uint64_t bits;   // scalars; container in a document: its object index
+  std::uint64_t bits;   // scalars; container in a document: which it is
   std::uint32_t size;   // text: bytes, data: bytes, container: elements
   std::uint32_t extra;  // text: UTF-16 units; container: where its references start
   Kind kind;
@@ -100,8 +100,8 @@ class Flattener {
     std::uint8_t height;
     bool isDictionary;
     const PropertyListDocument* document;  // null: built in memory
-    std::uint32_t documentObject;
-    const void* content;  // Array or DictionaryContent
+    std::uint32_t documentPlace;           // of its references
+    const void* content;                   // Array or DictionaryContent
   };
 
   // Gives the value a number; a container that is new goes on the stack.
@@ -200,8 +200,8 @@ class Flattener {
       content = isDictionary ? static_cast<const void*>(&ValueAccess::content(value))
                              : static_cast<const void*>(&ValueAccess::elements(value));
     }
-    stack_.push_back(
-        Frame{number, 0, 0, isDictionary, document, static_cast<std::uint32_t>(bits), content});
+    stack_.push_back(Frame{number, 0, 0, isDictionary, document,
+                           document == nullptr ? 0 : ValueAccess::place(value), content});
     if (isDictionary) addKeys(stack_.size() - 1);
     return number;
   }
@@ -211,8 +211,7 @@ class Flattener {
     for (std::uint32_t i = 0; i < container.size; ++i) {
       std::uint32_t key = 0;
       if (frame.document != nullptr) {
-        const DocumentNode& node = frame.document->node(frame.documentObject);
-        key = addText(frame.document->valueAt(frame.document->reference(node, i)));
+        key = addText(frame.document->valueAt(frame.document->reference(frame.documentPlace, i)));
       } else {
         const auto* content = static_cast<const DictionaryContent*>(frame.content);
         key = addText(content->entries()[i].key);
@@ -241,9 +240,9 @@ class Flattener {
   }
   std::uint32_t addElement(const Frame& frame, std::uint32_t index) {
     if (frame.document != nullptr) {
-      const DocumentNode& node = frame.document->node(frame.documentObject);
-      const std::size_t position = frame.isDictionary ? node.high + std::size_t{index} : index;
-      return add(frame.document->valueAt(frame.document->reference(node, position)));
+      const std::size_t keys = frame.isDictionary ? objects_[frame.object].size : 0;
+      return add(
+          frame.document->valueAt(frame.document->reference(frame.documentPlace, keys + index)));
     }
     if (frame.isDictionary) {
       return add(static_cast<const DictionaryContent*>(frame.content)->entries()[index].value);

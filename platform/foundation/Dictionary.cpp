@@ -64,8 +64,7 @@ std::size_t DictionaryView::size() const { return ValueAccess::size(value_); }
 std::string_view DictionaryView::keyAt(std::size_t index) const {
   requireIndex(index, size());
   if (const PropertyListDocument* document = ValueAccess::document(value_)) {
-    const DocumentNode& node = document->node(ValueAccess::objectIndex(value_));
-    return document->text(document->node(document->reference(node, index)));
+    return document->text(document->node(document->reference(ValueAccess::place(value_), index)));
   }
   return ValueAccess::text(ValueAccess::content(value_).entries()[index].key);
 }
@@ -73,8 +72,7 @@ std::string_view DictionaryView::keyAt(std::size_t index) const {
 Value DictionaryView::keyValueAt(std::size_t index) const {
   requireIndex(index, size());
   if (const PropertyListDocument* document = ValueAccess::document(value_)) {
-    const DocumentNode& node = document->node(ValueAccess::objectIndex(value_));
-    return document->valueAt(document->reference(node, index));
+    return document->valueAt(document->reference(ValueAccess::place(value_), index));
   }
   return ValueAccess::content(value_).entries()[index].key;
 }
@@ -82,8 +80,7 @@ Value DictionaryView::keyValueAt(std::size_t index) const {
 Value DictionaryView::valueAt(std::size_t index) const {
   requireIndex(index, size());
   if (const PropertyListDocument* document = ValueAccess::document(value_)) {
-    const DocumentNode& node = document->node(ValueAccess::objectIndex(value_));
-    return document->valueAt(document->reference(node, size() + index));
+    return document->valueAt(document->reference(ValueAccess::place(value_), size() + index));
   }
   return ValueAccess::content(value_).entries()[index].value;
 }
@@ -92,8 +89,7 @@ Value DictionaryView::find(std::string_view key) const { return value_[key]; }
 
 bool DictionaryView::contains(std::string_view key) const {
   if (const PropertyListDocument* document = ValueAccess::document(value_)) {
-    return document->positionOf(ValueAccess::objectIndex(value_), key) !=
-           PropertyListDocument::kNone;
+    return document->positionOf(value_, key) != PropertyListDocument::kNone;
   }
   return ValueAccess::content(value_).find(key) != nullptr;
 }
@@ -102,7 +98,7 @@ std::optional<std::uint32_t> DictionaryView::keyObjectIndexAt(std::size_t index)
   requireIndex(index, size());
   const PropertyListDocument* document = ValueAccess::document(value_);
   if (document == nullptr) return std::nullopt;
-  return document->reference(document->node(ValueAccess::objectIndex(value_)), index);
+  return document->reference(ValueAccess::place(value_), index);
 }
 
 std::size_t DictionaryView::documentObjectCount() const {

@@ -20,29 +20,39 @@ class EntryPeek {
   static bool can(const Value& container) {
     return ValueAccess::inDocument(container) && (container.isDictionary() || container.isArray());
   }
+  // The same of a value that is a dictionary, an array or null.
+  static bool canContainer(const Value& container) { return ValueAccess::inDocument(container); }
 
   // Names the file that a container was read from, as long as the container's value lives.
   static const void* document(const Value& container) { return documentOf(container); }
 
+  // Entries of a dictionary, elements of an array.
+  static std::size_t count(const Value& container) { return ValueAccess::size(container); }
+
   // The value of the position-th entry of a dictionary.
   static EntryPeek valueOf(const Value& dictionary, std::size_t position) {
     const PropertyListDocument* document = documentOf(dictionary);
-    const DocumentNode& node = document->node(ValueAccess::objectIndex(dictionary));
     const std::size_t count = ValueAccess::size(dictionary);
-    return EntryPeek(*document, document->reference(node, count + position));
+    return EntryPeek(*document,
+                     document->reference(ValueAccess::place(dictionary), count + position));
+  }
+  // The value under a key of a dictionary, which is found fastest at the expected position.
+  static std::optional<EntryPeek> find(const Value& dictionary, std::string_view key,
+                                       std::uint32_t expected) {
+    const std::size_t position = documentOf(dictionary)->positionOf(dictionary, key, expected);
+    if (position == PropertyListDocument::kNone) return std::nullopt;
+    return valueOf(dictionary, position);
   }
   // The index-th element of an array.
   static EntryPeek elementOf(const Value& array, std::size_t index) {
     const PropertyListDocument* document = documentOf(array);
-    const DocumentNode& node = document->node(ValueAccess::objectIndex(array));
-    return EntryPeek(*document, document->reference(node, index));
+    return EntryPeek(*document, document->reference(ValueAccess::place(array), index));
   }
   // Bytes that are equal for two dictionaries of one document exactly when they hold the same key
   // objects in the same order.
   static std::string_view keyBytes(const Value& dictionary) {
-    const PropertyListDocument* document = documentOf(dictionary);
-    return document->referenceBytes(document->node(ValueAccess::objectIndex(dictionary)),
-                                    ValueAccess::size(dictionary));
+    return documentOf(dictionary)
+        ->referenceBytes(ValueAccess::place(dictionary), ValueAccess::size(dictionary));
   }
 
   Kind kind() const { return node_.kind; }

@@ -48,11 +48,6 @@ Number Number::real(double value) {
   return Number(Type::kReal64, std::bit_cast<std::uint64_t>(value));
 }
 
-bool Number::boolValue() const {
-  if (isReal()) return doubleValue() != 0;
-  return bits_ != 0;
-}
-
 std::int64_t Number::int64Value() const {
   if (!isReal()) return static_cast<std::int64_t>(bits_);
   const double value = doubleValue();
@@ -69,12 +64,6 @@ std::uint64_t Number::uint64Value() const {
   if (value >= kTwo64) return std::numeric_limits<std::uint64_t>::max();
   if (value < 0) return static_cast<std::uint64_t>(int64Value());
   return static_cast<std::uint64_t>(value);
-}
-
-double Number::doubleValue() const {
-  if (isReal()) return std::bit_cast<double>(bits_);
-  if (type_ == Type::kUnsigned) return static_cast<double>(bits_);
-  return static_cast<double>(static_cast<std::int64_t>(bits_));
 }
 
 std::string Number::description() const {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <bit>
 #include <cstdint>
 #include <string>
 
@@ -27,12 +28,16 @@ class Number {
   // Conversions read the value in another type. Reals are truncated towards zero and saturate (a
   // negative real reads unsigned as its 64-bit two's complement, as a negative integer does);
   // NaN reads as 0. int32Value and int16Value take the low bits of the 64-bit integer reading.
-  bool boolValue() const;
+  bool boolValue() const { return isReal() ? doubleValue() != 0 : bits_ != 0; }
   std::int64_t int64Value() const;
   std::uint64_t uint64Value() const;
   std::int32_t int32Value() const { return static_cast<std::int32_t>(int64Value()); }
   std::int16_t int16Value() const { return static_cast<std::int16_t>(int64Value()); }
-  double doubleValue() const;
+  double doubleValue() const {
+    if (isReal()) return std::bit_cast<double>(bits_);
+    if (type_ == Type::kUnsigned) return static_cast<double>(bits_);
+    return static_cast<double>(static_cast<std::int64_t>(bits_));
+  }
 
   // Booleans print as 1 and 0, reals with the shortest text that reads back the same.
   std::string description() const;

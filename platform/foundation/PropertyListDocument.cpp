@@ -43,7 +43,7 @@ Value PropertyListDocument::valueAt(std::uint32_t object) const {
       return ValueAccess::textOrData(node.kind, this, text(node).data(), node.high);
     case Kind::kArray:
     case Kind::kDictionary:
-      return ValueAccess::container(node.kind, this, object, node.high);
+      return ValueAccess::container(node.kind, this, {object, node.low}, node.high);
     default:
       return ValueAccess::scalar(node.kind, static_cast<Number::Type>(node.detail), node.bits());
   }
@@ -93,22 +93,31 @@ void PropertyListDocument::growKeyTable() {
   }
 }
 
-std::size_t PropertyListDocument::positionOf(std::uint32_t object, std::string_view key) const {
-  const std::uint32_t number = keyNumber(key);
-  if (number == kNoKey) return kNone;
-  const DocumentNode& node = nodes_[object];
-  const std::uint32_t wanted = number + 1;
-  if (node.high <= kScanLimit) {
-    for (std::uint32_t i = 0; i < node.high; ++i) {
-      if (nodes_[reference(node, i)].extra == wanted) return i;
+std::size_t PropertyListDocument::positionOf(const Value& dictionary, std::string_view key,
+                                             std::uint32_t expected) const {
+  const std::uint32_t place = ValueAccess::place(dictionary);
+  const std::uint32_t count = ValueAccess::size(dictionary);
+  if (expected < count && isText(reference(place, expected), key)) return expected;
+  if (count <= kTextScanLimit) {
+    for (std::uint32_t i = 0; i < count; ++i) {
+      if (isText(reference(place, i), key)) return i;
     }
     return kNone;
   }
-  const LargeIndex& index = largeIndex(node);
+  const std::uint32_t number = keyNumber(key);
+  if (number == kNoKey) return kNone;
+  const std::uint32_t wanted = number + 1;
+  if (count <= kScanLimit) {
+    for (std::uint32_t i = 0; i < count; ++i) {
+      if (nodes_[reference(place, i)].extra == wanted) return i;
+    }
+    return kNone;
+  }
+  const LargeIndex& index = largeIndex(dictionary);
   const std::size_t mask = index.slots.size() - 1;
   for (std::size_t slot = number & mask; index.slots[slot] != 0; slot = (slot + 1) & mask) {
     const std::uint32_t position = index.slots[slot] - 1;
-    if (nodes_[reference(node, position)].extra == wanted) return position;
+    if (nodes_[reference(place, position)].extra == wanted) return position;
   }
   return kNone;
 }
@@ -124,16 +133,19 @@ void PropertyListDocument::indexLargeDictionaries(const std::vector<std::uint32_
 
 // Made by the first look-up; when two threads make it at once, one of the two is dropped.
 const PropertyListDocument::LargeIndex& PropertyListDocument::largeIndex(
-    const DocumentNode& node) const {
-  std::atomic<const LargeIndex*>& place = largeIndexes_[node.extra];
+    const Value& dictionary) const {
+  const std::uint32_t references = ValueAccess::place(dictionary);
+  const std::uint32_t count = ValueAccess::size(dictionary);
+  std::atomic<const LargeIndex*>& place =
+      largeIndexes_[nodes_[ValueAccess::objectIndex(dictionary)].extra];
   if (const LargeIndex* made = place.load(std::memory_order_acquire)) return *made;
   auto fresh = std::make_unique<LargeIndex>();
   std::size_t capacity = 64;
-  while (capacity < std::size_t{node.high} * 2) capacity *= 2;
+  while (capacity < std::size_t{count} * 2) capacity *= 2;
   fresh->slots.assign(capacity, 0);
   const std::size_t mask = capacity - 1;
-  for (std::uint32_t i = 0; i < node.high; ++i) {
-    std::size_t slot = (nodes_[reference(node, i)].extra - 1) & mask;
+  for (std::uint32_t i = 0; i < count; ++i) {
+    std::size_t slot = (nodes_[reference(references, i)].extra - 1) & mask;
     while (fresh->slots[slot] != 0) slot = (slot + 1) & mask;
     fresh->slots[slot] = i + 1;
   }

@@ -21,17 +21,14 @@ namespace kx {
 struct DocumentNode {
   // Where text or data stands: in the file's bytes at `low`, or in the arena.
   enum Place : std::uint8_t { kInFile, kInArena };
-  enum State : std::uint8_t { kWhite, kGrey, kBlack };
 
   std::uint32_t low;
   std::uint32_t high;
   // String: its number among the document's keys plus 1, 0 when it is no key. Container while it is
   // read: visits below it, itself included. Large dictionary afterwards: the number of its index.
   std::uint32_t extra;
-  Kind kind;            // kNull: not read yet
+  Kind kind;
   std::uint8_t detail;  // Number::Type, or Place
-  std::uint8_t height;  // containers: nesting at and below it
-  State state;
 
   std::uint64_t bits() const { return static_cast<std::uint64_t>(high) << 32 | low; }
   void setBits(std::uint64_t bits) {
@@ -50,6 +47,13 @@ using LazyArray = std::unique_ptr<T[], FreeMemory>;
 template <typename T>
 LazyArray<T> makeLazyArray(std::size_t count) {
   void* memory = std::calloc(count == 0 ? 1 : count, sizeof(T));
+  if (memory == nullptr) throw std::bad_alloc();
+  return LazyArray<T>(static_cast<T*>(memory));
+}
+// Memory whose content is nothing yet.
+template <typename T>
+LazyArray<T> makeRawArray(std::size_t count) {
+  void* memory = std::malloc((count == 0 ? 1 : count) * sizeof(T));
   if (memory == nullptr) throw std::bad_alloc();
   return LazyArray<T>(static_cast<T*>(memory));
 }
@@ -82,37 +86,55 @@ class PropertyListDocument final : public ValueStorage {
   Value valueAt(std::uint32_t object) const;
   std::uint32_t count() const { return count_; }
   const DocumentNode& node(std::uint32_t object) const { return nodes_[object]; }
+  // Fetches an object's node into the processor's cache; and of an object whose node is there, its
+  // content.
+  void prefetchNode(std::uint32_t object) const { __builtin_prefetch(&nodes_[object]); }
+  void prefetchContent(std::uint32_t object) const {
+    const DocumentNode& node = nodes_[object];
+    if (referenceSize_ == 0 || node.kind != Kind::kDictionary) return;
+    __builtin_prefetch(base_ + node.low);
+    __builtin_prefetch(base_ + node.low + 64);
+  }
   std::string_view text(const DocumentNode& node) const {
     const char* from = node.detail == DocumentNode::kInFile
                            ? reinterpret_cast<const char*>(base_) + node.low
                            : arena_.at(node.low);
     return {from, node.high};
   }
-  // The position-th reference of a container; of a dictionary, keys come first, then values.
-  std::uint32_t reference(const DocumentNode& node, std::size_t position) const {
-    if (referenceSize_ == 0) return references_[node.low + position];
+  // The position-th reference of the container whose references start at `place`; of a dictionary,
+  // keys come first, then values.
+  std::uint32_t reference(std::uint32_t place, std::size_t position) const {
+    if (referenceSize_ == 0) return references_[place + position];
     return static_cast<std::uint32_t>(
-        loadBig(base_ + node.low + position * referenceSize_, referenceSize_));
+        loadBigShifted(base_ + place + position * referenceSize_, referenceShift_));
   }
   // The first `count` references of a container as they are stored. Within one document equal bytes
   // are equal references.
-  std::string_view referenceBytes(const DocumentNode& node, std::size_t count) const {
+  std::string_view referenceBytes(std::uint32_t place, std::size_t count) const {
     if (referenceSize_ == 0) {
-      return {reinterpret_cast<const char*>(&references_[node.low]), count * sizeof(std::uint32_t)};
+      return {reinterpret_cast<const char*>(&references_[place]), count * sizeof(std::uint32_t)};
     }
-    return {reinterpret_cast<const char*>(base_) + node.low, count * referenceSize_};
+    return {reinterpret_cast<const char*>(base_) + place, count * referenceSize_};
   }
-  // Position of a key in a dictionary, or kNone.
-  std::size_t positionOf(std::uint32_t object, std::string_view key) const;
+  // Position of a key in a dictionary of this document, or kNone. Found at once at `expected`.
+  std::size_t positionOf(const Value& dictionary, std::string_view key,
+                         std::uint32_t expected = 0) const;
   static constexpr std::size_t kNone = static_cast<std::size_t>(-1);
-  // Dictionaries up to this size are scanned, larger ones get an index.
+  // Dictionaries up to this size are scanned, larger ones get an index; in the smallest the texts
+  // are compared, in the others the keys' numbers.
   static constexpr std::size_t kScanLimit = 24;
+  static constexpr std::size_t kTextScanLimit = 8;
 
   // Reads a big-endian integer of 1 to 8 bytes; 8 bytes from `from` on must be readable.
   static std::uint64_t loadBig(const std::uint8_t* from, unsigned size) {
+    return loadBigShifted(from, shiftOf(size));
+  }
+  // The same for loops: with the shift for that size.
+  static unsigned shiftOf(unsigned size) { return 64 - 8 * size; }
+  static std::uint64_t loadBigShifted(const std::uint8_t* from, unsigned shift) {
     std::uint64_t raw;
     std::memcpy(&raw, from, sizeof(raw));
-    return __builtin_bswap64(raw) >> (64 - 8 * size);
+    return __builtin_bswap64(raw) >> shift;
   }
 
  private:
@@ -124,6 +146,11 @@ class PropertyListDocument final : public ValueStorage {
     std::vector<std::uint32_t> slots;
   };
 
+  bool isText(std::uint32_t object, std::string_view text) const {
+    const DocumentNode& node = nodes_[object];
+    return node.high == text.size() && this->text(node) == text;
+  }
+
   // The number of the key with this text, or kNoKey.
   static constexpr std::uint32_t kNoKey = 0xFFFFFFFF;
   std::uint32_t keyNumber(std::string_view text) const;
@@ -132,7 +159,7 @@ class PropertyListDocument final : public ValueStorage {
   void growKeyTable();
   // Called once, after the last change.
   void indexLargeDictionaries(const std::vector<std::uint32_t>& objects);
-  const LargeIndex& largeIndex(const DocumentNode& node) const;
+  const LargeIndex& largeIndex(const Value& dictionary) const;
 
   DataPtr data_;
   const std::uint8_t* base_;
@@ -140,6 +167,7 @@ class PropertyListDocument final : public ValueStorage {
   LazyArray<DocumentNode> nodes_;
   std::uint32_t count_ = 0;
   unsigned referenceSize_ = 0;  // bytes of a reference in the file; 0: references_ holds them
+  unsigned referenceShift_ = 0;
   LazyArray<std::uint32_t> references_;
   DocumentArena arena_;
 

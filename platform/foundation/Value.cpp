@@ -11,6 +11,16 @@
 namespace kx {
 namespace {
 
+// How many elements ahead of a loop it is worth to fetch.
+constexpr std::size_t kNear = 8;
+
+// As ValueAccess::document, in line.
+inline const PropertyListDocument* documentOf(const Value& value) {
+  return ValueAccess::inDocument(value)
+             ? static_cast<const PropertyListDocument*>(ValueAccess::owner(value))
+             : nullptr;
+}
+
 void requireRoom(std::size_t size) {
   if (size > std::numeric_limits<std::uint32_t>::max() - 1) {
     throw InternalInconsistency("a value is too large");
@@ -230,11 +240,10 @@ DictionaryView Value::dictionaryValue() const {
 
 Value Value::operator[](std::string_view key) const {
   if (kind_ != Kind::kDictionary) return Value();
-  if (const PropertyListDocument* document = ValueAccess::document(*this)) {
-    const std::uint32_t object = ValueAccess::objectIndex(*this);
-    const std::size_t position = document->positionOf(object, key);
+  if (const PropertyListDocument* document = documentOf(*this)) {
+    const std::size_t position = document->positionOf(*this, key);
     if (position == PropertyListDocument::kNone) return Value();
-    return document->valueAt(document->reference(document->node(object), size_ + position));
+    return document->valueAt(document->reference(ValueAccess::place(*this), size_ + position));
   }
   const Value* found = ValueAccess::content(*this).find(key);
   return found == nullptr ? Value() : *found;
@@ -243,22 +252,31 @@ Value Value::operator[](std::string_view key) const {
 std::size_t ArrayView::size() const { return ValueAccess::size(value_); }
 
 OptionalString ArrayView::stringAt(std::size_t index, std::string_view key) const {
-  if (index >= size()) throw InternalInconsistency("array index out of bounds");
-  const PropertyListDocument* document = ValueAccess::document(value_);
+  if (index >= ValueAccess::size(value_)) throw InternalInconsistency("array index out of bounds");
+  const PropertyListDocument* document = documentOf(value_);
   if (document == nullptr) return ValueAccess::elements(value_)[index].asString(key);
-  const DocumentNode& node =
-      document->node(document->reference(document->node(ValueAccess::objectIndex(value_)), index));
+  if (index + kNear < ValueAccess::size(value_)) {
+    document->prefetchNode(document->reference(ValueAccess::place(value_), index + kNear));
+  }
+  const DocumentNode& node = document->node(document->reference(ValueAccess::place(value_), index));
   if (node.kind != Kind::kString) {
     throw TypeError(key, kindName(Kind::kString), kindName(node.kind));
   }
   return document->text(node);
 }
 
+void ArrayView::prefetchBehind(std::size_t index) const {
+  const PropertyListDocument* document = documentOf(value_);
+  if (document == nullptr || index + 2 * kNear >= ValueAccess::size(value_)) return;
+  const std::uint32_t place = ValueAccess::place(value_);
+  document->prefetchNode(document->reference(place, index + 2 * kNear));
+  document->prefetchContent(document->reference(place, index + kNear));
+}
+
 Value ArrayView::operator[](std::size_t index) const {
-  if (index >= size()) throw InternalInconsistency("array index out of bounds");
-  if (const PropertyListDocument* document = ValueAccess::document(value_)) {
-    const DocumentNode& node = document->node(ValueAccess::objectIndex(value_));
-    return document->valueAt(document->reference(node, index));
+  if (index >= ValueAccess::size(value_)) throw InternalInconsistency("array index out of bounds");
+  if (const PropertyListDocument* document = documentOf(value_)) {
+    return document->valueAt(document->reference(ValueAccess::place(value_), index));
   }
   return ValueAccess::elements(value_)[index];
 }

@@ -184,7 +184,7 @@ class Value {
   }
 
   union Payload {
-    std::uint64_t bits;   // number, date (bits of the double), uid; container: its object index
+    std::uint64_t bits;   // number, date (bits of the double), uid; container: see ValueStorage.h
     const void* pointer;  // string, data
   };
 
@@ -207,6 +207,9 @@ class ArrayView {
   // The text of an element as its asString gives it, without making a value; it lives as long as
   // the array.
   OptionalString stringAt(std::size_t index, std::string_view key) const;
+  // For loops over very many elements of a file: has the processor fetch what stands some elements
+  // behind this one.
+  void prefetchBehind(std::size_t index) const;
 
   class Iterator {
    public:

@@ -100,13 +100,18 @@ struct ValueAccess {
     value.inDocument_ = owner->type() == ValueStorage::Type::kDocument;
     return value;
   }
-  static Value container(Kind kind, const ValueStorage* document, std::uint32_t index,
+  // A container of a document: its object, and where its references start.
+  struct Container {
+    std::uint32_t object;
+    std::uint32_t place;
+  };
+  static Value container(Kind kind, const ValueStorage* document, Container container,
                          std::uint32_t count) {
     Value value;
     document->retain();
     value.owner_ = document;
     value.kind_ = kind;
-    value.payload_.bits = index;
+    value.payload_.bits = static_cast<std::uint64_t>(container.place) << 32 | container.object;
     value.size_ = count;
     value.inDocument_ = true;
     return value;
@@ -128,6 +133,9 @@ struct ValueAccess {
   static const PropertyListDocument* document(const Value& value);
   static std::uint32_t objectIndex(const Value& value) {
     return static_cast<std::uint32_t>(value.payload_.bits);
+  }
+  static std::uint32_t place(const Value& value) {
+    return static_cast<std::uint32_t>(value.payload_.bits >> 32);
   }
   // For containers built in memory.
   static const Array& elements(const Value& value) {

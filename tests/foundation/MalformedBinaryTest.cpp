@@ -419,6 +419,26 @@ INSTANTIATE_TEST_SUITE_P(KeyType, MalformedBinary, testing::ValuesIn(keyTypeRows
 INSTANTIATE_TEST_SUITE_P(Encoding, MalformedBinary, testing::ValuesIn(encodingRows()), nameOf);
 INSTANTIATE_TEST_SUITE_P(Range, MalformedBinary, testing::ValuesIn(rangeRows()), nameOf);
 
+// Text is tested several bytes at once: whatever its length, each byte counts and none behind it.
+TEST(MalformedBinaryText, EachByteOfAnAsciiStringIsTested) {
+  for (std::size_t length = 0; length <= 50; ++length) {
+    BinaryFile file;
+    file.objects = {file.array({1, 2}), ascii(std::string(length, 'x')), utf16({0xFFFF, 0x80})};
+    ASSERT_EQ(readBytes(file.bytes()).error, nullptr) << length;
+    for (std::size_t at = 0; at < length; ++at) {
+      for (const char wrong : {'\0', '\x80', '\xFF'}) {
+        std::string content(length, '\x01');
+        content[at] = wrong;
+        content.back() = at + 1 < length ? '\x7F' : wrong;
+        file.objects[1] = ascii(content);
+        const Reading reading = readBytes(file.bytes());
+        ASSERT_EQ(reading.codeName(), "E_TEXT_ENCODING") << length << " " << at;
+        ASSERT_EQ(reading.offset(), file.offsetOf(2) - length + at);
+      }
+    }
+  }
+}
+
 TEST(MalformedBinaryPath, NamesTheKeysDownToTheValue) {
   BinaryFile file;
   file.objects = {file.dictionary({1}, {2}),

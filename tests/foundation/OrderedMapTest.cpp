@@ -16,6 +16,17 @@ std::string describe(const OrderedMap<int>& map) {
   return text;
 }
 
+TEST(OrderedMap, AnnouncedKeysAreSetAsOthersAre) {
+  OrderedMap<int> map;
+  std::vector<std::uint64_t> hashes;
+  for (int i = 0; i < 100; ++i) hashes.push_back(map.announce(std::to_string(i % 60)));
+  for (int i = 0; i < 100; ++i) {
+    map.setHashed(Value::string(std::to_string(i % 60)), i, hashes[static_cast<std::size_t>(i)]);
+  }
+  EXPECT_EQ(map.size(), 60U);
+  for (int i = 0; i < 60; ++i) EXPECT_EQ(*map.find(std::to_string(i)), i < 40 ? i + 60 : i);
+}
+
 TEST(OrderedMap, KeepsOrderThroughReplacementAndRemoval) {
   OrderedMap<int> map;
   map.set("b", 1);

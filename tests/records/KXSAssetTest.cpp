@@ -336,6 +336,46 @@ TEST(KXSFace, FacesComeInOrderEvenWithABadRectangle) {
                 face(Value::integer(1), text("no rectangle")).description());
 }
 
+TEST(KXSFace, KeysMayStandInAnyOrderAndBesideOthers) {
+  const Value source = dict(
+      {{"faces",
+        list({dict({{"other", text("x")},
+                    {"faceRectangle", dict({{"Height", Value::real(0.5)},
+                                            {"Width", Value::integer(1)},
+                                            {"Z", text("z")},
+                                            {"Y", Value::real(0.25)},
+                                            {"X", Value::boolean(true)}})},
+                    {"faceIndex", Value::integer(7)},
+                    {"faceAlbumUUID", text("person")}}),
+              dict({{"faceRectangle", rectangle(0, 0, 1, 1)}, {"faceIndex", Value::real(2)}})})}});
+  for (const Value& value :
+       {source, throughFile(source), throughFile(source, PropertyListFormat::kXml)}) {
+    const auto faces = assetOf(value)->getFacesArray();
+    ASSERT_EQ(faces.size(), 2U);
+    EXPECT_EQ(faces[0]->albumUUID(), "person");
+    EXPECT_EQ(faces[0]->identifier(), 7);
+    EXPECT_EQ(faces[0]->relativeRect(), (Rect{1, 0.25, 1, 0.5}));
+    EXPECT_EQ(faces[1]->albumUUID(), std::nullopt);
+    EXPECT_EQ(faces[1]->identifier(), 2);
+    EXPECT_EQ(faces[1]->relativeRect(), (Rect{0, 0, 1, 1}));
+  }
+}
+
+TEST(KXSFace, ARectangleThatIsNoneInAFileIsAllZero) {
+  CapturedLog log;
+  const Array wrong = {text("no rectangle"), list({}), dict({{"X", Value::real(1)}}),
+                       dict({{"X", Value::real(1)},
+                             {"Y", text("2")},
+                             {"Width", Value::real(3)},
+                             {"Height", Value::real(4)}})};
+  for (const Value& value : wrong) {
+    const KXSAssetPtr asset =
+        assetOf(throughFile(dict({{"faces", list({face(Value::integer(1), value)})}})));
+    EXPECT_EQ(asset->getFacesArray().at(0)->relativeRect(), Rect());
+  }
+  EXPECT_EQ(log.standardMessages().size(), wrong.size());
+}
+
 TEST(KXSFace, NoListOfFacesGivesNoFaces) {
   EXPECT_TRUE(assetOf(dict({}))->getFacesArray().empty());
   EXPECT_TRUE(KXSAsset::asset()->getFacesArray().empty());

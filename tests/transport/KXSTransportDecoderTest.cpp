@@ -122,6 +122,41 @@ TEST(KXSTransportDecoder, ALaterItemReplacesAnEarlierOneButNotInTheOrder) {
   EXPECT_EQ(*kept, (*snapshot->orderedAlbums())[2]);
 }
 
+TEST(KXSTransportDecoder, AssetsKeepTheirOrderAndTheLastOfEachIdentifier) {
+  // Repetitions near and far, more and fewer than are inserted at once.
+  for (const std::size_t count : {1U, 15U, 16U, 17U, 40U, 500U}) {
+    Array updates;
+    std::vector<std::string> expected;
+    const auto asset = [](std::size_t number, std::string_view caption) {
+      return dict({{"uuid", text("asset " + std::to_string(number))},
+                   {"itemType", text("Asset")},
+                   {"caption", text(caption)}});
+    };
+    for (std::size_t i = 0; i < count; ++i) {
+      expected.push_back("asset " + std::to_string(i));
+      updates.push_back(asset(i, "first"));
+      if (i % 3 == 0) updates.push_back(asset(i, "again"));
+      if (i % 3 == 1) updates.push_back(event("E" + std::to_string(i), "e"));
+      if (i % 5 == 4) updates.push_back(asset(i / 2, "late"));
+    }
+    const Value source = root(std::move(updates));
+    for (const Value& value :
+         {source, throughFile(source), throughFile(source, PropertyListFormat::kXml)}) {
+      const auto snapshot = decode(value);
+      EXPECT_EQ(keysOf(*snapshot->assetsByUUID()), expected);
+      for (const auto& entry : *snapshot->assetsByUUID()) {
+        EXPECT_EQ(entry.value->uuid(), entry.key.stringValue());
+        EXPECT_EQ(snapshot->assetsByUUID()->find(entry.key.stringValue()), &entry.value);
+      }
+      EXPECT_EQ((*snapshot->assetsByUUID()->find("asset 0"))->caption(), "again");
+      if (count > 4) {
+        EXPECT_EQ((*snapshot->assetsByUUID()->find("asset 2"))->caption(), "late");
+      }
+      EXPECT_EQ(snapshot->orderedAlbums()->size(), (count + 1) / 3);
+    }
+  }
+}
+
 TEST(KXSTransportDecoder, DeletesHoldItemsOfEveryKind) {
   const Value source = dict({{"deletes", list({item("Asset", "a"), item("Album", "b"),
                                                item("Event", "c"), item("Asset", "b")})}});
