@@ -32,24 +32,11 @@ LibraryStore::LibraryStore(Parts parts)
 LibraryStore::~LibraryStore() = default;
 
 void LibraryStore::beginReading() {
-  if (parts_.planOnly || isReading_) return;
-  try {
-    database().execute("BEGIN");
-    isReading_ = true;
-  } catch (const SqliteError&) {
-  }
+  if (!parts_.planOnly && !isReading_) isReading_ = database().beginReading();
 }
 
 void LibraryStore::endReading() {
-  if (!std::exchange(isReading_, false)) return;
-  try {
-    database().execute("COMMIT");
-  } catch (const SqliteError&) {
-    try {
-      database().rollback();
-    } catch (const SqliteError&) {  // an error has ended it already
-    }
-  }
+  if (std::exchange(isReading_, false)) database().endReading();
 }
 
 ErrorPtr LibraryStore::write(const Work& work, const LibraryContext* origin) {

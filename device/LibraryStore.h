@@ -43,8 +43,8 @@ class LibraryStore {
   HealthRecord& health() { return *parts_.health; }
   const DeviceLog& log() { return *parts_.log; }
 
-  // What is read until endReading, or the next write, takes the database's lock once instead of
-  // once a statement. Both only tune: a failure shows at the next statement.
+  // What is read until endReading, or the next write, takes the database's lock once. Both only
+  // tune: a failure shows at the next statement.
   void beginReading();
   void endReading();
 

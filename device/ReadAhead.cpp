@@ -7,8 +7,9 @@ namespace kx {
 void ReadAhead::start(const std::shared_ptr<LibraryStore>& store) {
   isOn_ = true;
   store->queue().async([self = shared_from_this(), store] {
-    if (!self->isOn_ || self->context_) return;
-    auto context = std::make_shared<LibraryContext>(store);
+    if (!self->isOn_) return;
+    std::shared_ptr<LibraryContext> context = self->take();
+    if (!context) context = std::make_shared<LibraryContext>(store);
     context->readAhead(self->isOn_);
     self->giveBack(std::move(context));
   });

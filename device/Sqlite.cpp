@@ -99,6 +99,17 @@ void SqliteDatabase::execute(const char* sql) {
   if (code != SQLITE_OK) fail(code, "the library cannot be worked on");
 }
 
+bool SqliteDatabase::beginReading() {
+  return sqlite3_exec(connection_, "BEGIN", nullptr, nullptr, nullptr) == SQLITE_OK;
+}
+
+void SqliteDatabase::endReading() {
+  // Some failures have ended it already.
+  if (sqlite3_get_autocommit(connection_) != 0) return;
+  const int code = sqlite3_exec(connection_, "COMMIT", nullptr, nullptr, nullptr);
+  if (code != SQLITE_OK) sqlite3_exec(connection_, "ROLLBACK", nullptr, nullptr, nullptr);
+}
+
 void SqliteDatabase::commit() {
   for (int attempt = 1;; ++attempt) {
     ++statementsRun_;

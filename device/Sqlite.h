@@ -50,6 +50,10 @@ class SqliteDatabase {
   // Commits, again and again for a minute while readers of other processes are in the way.
   void commit();
   void rollback();
+  // What is read in between takes the file's lock once instead of once a statement. Neither counts
+  // as a statement; false when it cannot begin.
+  bool beginReading();
+  void endReading();
   // From now on no commit succeeds: whoever tries one gets an error and a rollback.
   void refuseCommits();
   // Puts all of this database, as of one moment, in the place of all that is in the target, as one

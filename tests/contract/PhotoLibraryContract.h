@@ -30,6 +30,8 @@ class ContractDevice {
   virtual void addAlbum(const AlbumSeed& seed) = 0;
   // UUIDs of the album's assets in the album's order, as saved.
   virtual std::vector<std::string> assetsOfAlbum(const std::string& uuid) = 0;
+  // Whether a new library object may know objects that nobody has touched.
+  virtual bool readsAhead() const { return false; }
   // The next transaction fails to commit.
   virtual void failNextCommit() = 0;
 };
@@ -376,7 +378,9 @@ TEST_P(PhotoLibraryContract, EveryTouchedObjectIsRegistered) {
   addAsset("A");
   addAlbum("ALBUM", {"A"});
   read([&] {
-    EXPECT_TRUE(library().managedObjectContext().registeredObjects().empty());
+    if (!device_->readsAhead()) {
+      EXPECT_TRUE(library().managedObjectContext().registeredObjects().empty());
+    }
     const KXGenericAlbumPtr album = library().albumWithUUID("ALBUM");
     const KXManagedAssetPtr asset = library().assetWithUUID("A");
     const auto objects = library().managedObjectContext().registeredObjects();

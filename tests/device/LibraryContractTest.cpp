@@ -69,6 +69,7 @@ class SqliteContractDevice : public ContractDevice {
     return {"no such album"};
   }
 
+  bool readsAhead() const override { return readsAhead_; }
   void failNextCommit() override { FaultVfs::shared().failAt(0, SQLITE_FULL); }
 
  private:
