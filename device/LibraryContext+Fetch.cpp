@@ -158,15 +158,17 @@ void LibraryContext::prefetchAlbums(const std::vector<KXManagedAssetPtr>& assets
   SqliteStatement row(store_->database(),
                       "SELECT asset, album FROM memberships ORDER BY asset, album");
   bool more = nextRow(row);
+  std::vector<KXGenericAlbumPtr> found;
   for (const KXManagedAssetPtr& object : assets) {
     StoredAsset& owner = static_cast<StoredAsset&>(*object);
     while (more && row.integerAt(0) < owner.pk_) more = nextRow(row);
     if (owner.relationsChanged_) continue;
-    owner.albums_.clear();
+    found.clear();
     for (; more && row.integerAt(0) == owner.pk_; more = nextRow(row)) {
       const std::shared_ptr<StoredAlbum>& holder = albums_.at(row.integerAt(1));
-      if (!holder->isDeleted()) owner.albums_.push_back(holder);
+      if (!holder->isDeleted()) found.push_back(holder);
     }
+    owner.albums_.assign(found.begin(), found.end());
     owner.albumsRead_ = true;
     owner.albumsEpoch_ = albumsEpoch_;
   }

@@ -94,6 +94,7 @@ void LibraryStore::published(LibraryWriter& writer, const LibraryContext* origin
     if (context != origin) context->refreshRows(writer.rows());
   }
   if (releaser_ && !writer.releasedFiles().empty()) releaser_(std::move(writer.releasedFiles()));
+  if (onCommit_) onCommit_();
 }
 
 ObjectID LibraryStore::objectID(const char* entity, RowId pk) const {

@@ -60,6 +60,9 @@ class LibraryStore {
   // Grows with every transaction that has changed assets, their faces or memberships.
   std::uint64_t assetChanges() const { return assetChanges_; }
 
+  // Called, on the queue, after every commit.
+  void setOnCommit(std::function<void()> onCommit) { onCommit_ = std::move(onCommit); }
+
   RowId newAlbumId() { return ++lastAlbum_; }
   RowId newFaceId() { return ++lastFace_; }
   ObjectID objectID(const char* entity, RowId pk) const;
@@ -87,6 +90,7 @@ class LibraryStore {
   ErrorPtr broken_;  // what made the connection unfit for writing
   std::vector<LibraryContext*> contexts_;
   std::function<void(std::vector<std::string>)> releaser_;
+  std::function<void()> onCommit_;
   std::uint64_t listSorts_ = 0;
   std::uint64_t assetChanges_ = 0;
   bool isReading_ = false;

@@ -44,8 +44,8 @@ class Quarryd {
   // Ends a restore that a marker tells of: completes what is there; with `recreateAlbums` it also
   // takes in the camera's files that the library does not know, and the albums of the backup.
   void finalizeRestore(bool recreateAlbums);
-  // A hint: the seal is gone, so that the snapshot in place will have to be proved again. What that
-  // takes of the snapshot is read meanwhile.
+  // A hint: the snapshot in place will have to be proved. What that takes of the snapshot is read
+  // meanwhile.
   void expectSeal();
   // While a restore runs no sync is sealed.
   void setRestoring(bool restoring) { restoring_ = restoring; }

@@ -6,6 +6,7 @@
 #include <sys/syscall.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <cerrno>
 #include <mutex>
 #include <stdexcept>
@@ -155,6 +156,7 @@ class StoreDevice : public ReferenceDevice, public Platform {
   std::unique_ptr<Quarryd> quarryd_;
   std::unique_ptr<DeviceSaver> saver_;
   std::unique_ptr<DevicePorter> porter_;
+  std::atomic<bool> isUnsealed_{false};
   DispatchQueuePtr globalQueue_;
   std::mutex restoreMutex_;
   std::vector<QBFile> restoreFiles_;
@@ -302,8 +304,12 @@ void StoreDevice::startQuarryd(std::unique_ptr<MediaStore> media) {
   parts.files = files_;
   parts.filesPerFolder = options_.filesPerFolder;
   quarryd_ = std::make_unique<Quarryd>(std::move(parts));
+  // With the first commit after the seal is gone the worst throng of a sync is over.
   realFiles_->setOnRemoved([this](const std::string& path) {
-    if (path == device_paths::kLastSynced && quarryd_) quarryd_->expectSeal();
+    if (path == device_paths::kLastSynced) isUnsealed_ = true;
+  });
+  store_->setOnCommit([this] {
+    if (isUnsealed_.exchange(false)) quarryd_->expectSeal();
   });
   store_->setFileReleaser(
       [this](std::vector<std::string> paths) { quarryd_->removeFiles(std::move(paths)); });
@@ -381,7 +387,10 @@ StoreDevice::~StoreDevice() {
   stopReadingAhead();
   drain();
   const bool filesLeft = !quarryd_ || quarryd_->leftFilesBehind();
-  store_->queue().sync([this] { store_->setFileReleaser(nullptr); });
+  store_->queue().sync([this] {
+    store_->setFileReleaser(nullptr);
+    store_->setOnCommit(nullptr);
+  });
   realFiles_->setOnRemoved(nullptr);
   porter_.reset();
   saver_.reset();

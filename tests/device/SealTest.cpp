@@ -39,10 +39,12 @@ TEST_F(SealTest, LeavesAnEqualCopyAlone) {
   EXPECT_EQ(device().takeCounters().rowsWritten, 0U);
 }
 
-// Its going makes the device read what the next proof takes.
+// The first commit after it is gone makes the device read what the next proof takes.
 TEST_F(SealTest, AfterItIsGoneTheSnapshotInPlaceThenIsProved) {
+  int albums = 0;
   const auto unseal = [&] {
     ASSERT_TRUE(platform().files().removeItem(device_paths::kLastSynced, nullptr));
+    makeContainer("ALBUM-" + std::to_string(++albums));
     device().drain();
   };
   putSnapshot({kUUID1});
