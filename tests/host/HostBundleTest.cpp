@@ -132,6 +132,28 @@ TEST_F(HostBundle, IdentifiersNeverLeadOutOfMedia) {
   EXPECT_EQ(error->code(), EINVAL);
 }
 
+// A sync takes the snapshot and goes on to ask for files.
+TEST_F(HostBundle, WithoutTheSnapshotThatWasTakenItStillGivesItsFiles) {
+  const auto folder = openHost(photos_.path());
+  const std::string path = target_.at("bundle");
+  ASSERT_EQ(writeErrorCode(*folder, path), 0);
+  for (const auto& library : {openHost(path), openHost(photos_.path())}) {
+    const std::string before = snapshotOf(*library);
+    const DataPtr taken = library->takeSnapshotBytes();
+    ASSERT_NE(taken, nullptr);
+    EXPECT_EQ(std::string(taken->span().begin(), taken->span().end()), before);
+    EXPECT_EQ(library->snapshotBytes(), nullptr);
+    library->expectMedia();
+    library->expectMedia();
+    const auto names = folder->mediaNames();
+    ASSERT_EQ(library->mediaNames().size(), names.size());
+    EXPECT_EQ(contentOf(*library, names[0].uuid), contentOf(*folder, names[0].uuid));
+  }
+  const auto bundle = openHost(path);
+  bundle->takeSnapshotBytes();
+  EXPECT_EQ(bundle->libraryUUID(), "");
+}
+
 TEST_F(HostBundle, ASnapshotThatCannotBeReadIsAnError) {
   target_.makeFolder("media");
   target_.makeFolder("PhotoLibrary.plist");
