@@ -196,19 +196,25 @@ class RestoreKillTest : public testing::Test {
 
   void killAtRandomPoints(const std::string& backup) {
     fs::remove_all(at("killed"));
-    const std::uint64_t effects = runTraced(restoreCommand(backup), 0).effects;
+    std::uint64_t effects = runTraced(restoreCommand(backup), 0).effects;
     ASSERT_GT(effects, static_cast<std::uint64_t>(kPointsPerWay));
     expectRestored();
     const unsigned seed = std::random_device()();
     SCOPED_TRACE("seed " + std::to_string(seed));
     std::printf("seed %u, %llu calls\n", seed, static_cast<unsigned long long>(effects));
     std::mt19937_64 random(seed);
-    int killed = 0;
-    for (int i = 0; i < kPointsPerWay; ++i) {
+    int missed = 0;
+    for (int i = 0; i < kPointsPerWay;) {
       const std::uint64_t point = 1 + random() % effects;
       SCOPED_TRACE("killed before call " + std::to_string(point));
       fs::remove_all(at("killed"));
-      if (runTraced(restoreCommand(backup), point).killed) ++killed;
+      const auto run = runTraced(restoreCommand(backup), point);
+      if (!run.killed) {
+        // How many calls there are depends on how the files fall into batches, and that on time.
+        effects = std::min(effects, run.effects);
+        ASSERT_LE(++missed, kPointsPerWay);
+        continue;
+      }
       // Every third restore is killed a second time.
       if (i % 3 == 0) runTraced(restoreCommand(backup), 1 + random() % effects);
       const Json result = succeed(restoreCommand(backup));
@@ -216,9 +222,8 @@ class RestoreKillTest : public testing::Test {
       expectRestored();
       if (i % 5 == 0) expectSyncedAgain();
       if (HasFailure()) return;
+      ++i;
     }
-    // The number of calls varies a little between runs.
-    EXPECT_GE(killed, kPointsPerWay - 3);
   }
 
   fs::path top_;
