@@ -112,7 +112,8 @@ class HostLibrary {
   // knows neither UUID nor kind.
   virtual DataPtr takeSnapshotBytes() = 0;
 
-  // A hint: media files are going to be asked for.
+  // A hint: media files are going to be asked for. Returns at once; what it begins has ended when
+  // the library goes, and a failure shows in the operations that need it.
   virtual void expectMedia() const {}
 
   // The file of an asset. Null and an error: ENOENT when the host has no file for it, ELOOP for a
