@@ -176,32 +176,12 @@ void KXSyncClient::_reorderAlbumListProxy(KXManagedAlbumList& list,
   list.reorder(std::move(arranged));
 }
 
-// The asset order file: each album's assets with their indexes. Empty when it cannot be written.
-std::vector<std::uint8_t> KXSyncClient::assetOrderBytes(const KXSItemMapPtr& albumsAndEvents) {
-  Dictionary orders;
-  static const KXSItemMap kNoItems;
-  for (const auto& entry : albumsAndEvents ? *albumsAndEvents : kNoItems) {
-    const auto* album = dynamic_cast<const KXSAlbum*>(entry.value.get());
-    if (album == nullptr) continue;
-    const Value uuid = album->uuidValue();
-    if (uuid.isNull()) continue;
-    Dictionary order;
-    std::uint64_t index = 0;
-    if (const std::optional<ArrayView> assets = album->assetUUIDs()) {
-      for (const Value& asset : *assets) order.set(asset, Value::unsignedInteger(index++));
-    }
-    orders.set(uuid, Value::dictionary(std::move(order)));
-  }
-  return writePropertyList(Value::dictionary(std::move(orders)), PropertyListFormat::kBinary,
-                           nullptr);
-}
-
 void KXSyncClient::_persistAssetAlbumOrderStructures() {
   KXPhotoLibraryFramework& framework = platform_.photoLibrary();
   const std::string path = framework.pathToAssetAlbumOrderStructure();
   platform_.files().removeItem(path, nullptr);
-  const std::vector<std::uint8_t> bytes =
-      assetOrder_.valid() ? assetOrder_.get() : assetOrderBytes(albumsAndEvents_);
+  if (!hostWork_.assetOrder.valid()) startHostWork();
+  const std::vector<std::uint8_t> bytes = hostWork_.assetOrder.get();
   if (bytes.empty() || !platform_.files().writeFileAtomically(path, bytes, nullptr)) {
     KX_LOG(kClientSource, "_persistAssetAlbumOrderStructures", LogLevel::kError,
            "Failed to write assetOrdersByAlbumUUID to path %@", path);

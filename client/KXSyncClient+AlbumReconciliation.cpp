@@ -85,8 +85,6 @@ KXGenericAlbumPtr KXSyncClient::_addAlbumNamed(OptionalString name, std::string_
 }
 
 void KXSyncClient::_reconcileAlbums(const DispatchGroupPtr& group) {
-  // Made while the transaction before is still at work.
-  assetOrder_ = std::async(std::launch::async, &assetOrderBytes, albumsAndEvents_);
   submitTransaction(group, [this] { reconcileAlbumsInTransaction(); });
 }
 

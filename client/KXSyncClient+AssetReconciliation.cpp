@@ -1,7 +1,8 @@
 #include <algorithm>
 #include <cmath>
-#include <limits>
+#include <utility>
 
+#include "client/DeviceAssets.h"
 #include "client/KXSyncClient.h"
 #include "client/LogSource.h"
 #include "client/Memberships.h"
@@ -11,14 +12,7 @@ namespace kx {
 namespace {
 
 constexpr const char* kReconcileAssets = "_reconcileAssets";
-constexpr double kTokenEpsilon = 2.220446049250313e-16;
-constexpr double kTieStepDivisor = 100000.0;
-constexpr double kNoPreviousTime = -1.0;
-
-double secondsOf(const std::optional<Number>& hostTime) {
-  const double interval = hostTime ? hostTime->doubleValue() : 0.0;
-  return dateWithTesselTimeInterval(interval).secondsSinceReference;
-}
+const KXSAssetMap kNoAssets;
 
 void deleteWithFaces(KXManagedAsset& asset) {
   // A copy: the asset's own list changes with every deletion.
@@ -75,107 +69,65 @@ class HostFaces {
 
 // The working data of one asset reconciliation. Lives inside its transaction.
 struct KXSyncClient::AssetReconciliation {
-  DeviceAssetMap deviceAssets;
-  DeviceAlbumMap deviceAlbums;
-  const KXSAssetMap* hostAssets = nullptr;
-  std::optional<Memberships> memberships;
-  OrderedMap<double>::Cursor nextToken;
+  const KXSAssetMap& hostAssets;
+  DeviceAssets deviceAssets;
+  DeviceAlbumMap deviceAlbums = {};
+  std::optional<Memberships> memberships = std::nullopt;
 };
 
-std::optional<KXSyncClient::DeviceAssetMap> KXSyncClient::_onDeviceAssetsByUUID() {
+const KXSAssetMap& KXSyncClient::hostAssets() const {
+  return uuidToKXSAsset_ ? *uuidToKXSAsset_ : kNoAssets;
+}
+
+std::optional<DeviceAssets> KXSyncClient::_onDeviceAssetsByUUID() {
   AssetFetchRequest request;
   request.prefetchFaces = true;
   request.prefetchAlbums = true;
   request.fetchOnlyUUID = true;
   ErrorPtr error;
-  const auto assets = library_->managedObjectContext().fetchAssets(request, &error);
+  auto assets = library_->managedObjectContext().fetchAssets(request, &error);
   if (!assets) {
     KX_LOG(kClientSource, "_onDeviceAssetsByUUID", LogLevel::kError,
            "Error Reconciling Photos: Cannot fetch on device photos %@", error);
     return std::nullopt;
   }
-  DeviceAssetMap map;
-  map.reserve(assets->size());
-  static const KXSAssetMap kNoAssets;
-  const KXSAssetMap& hostAssets = uuidToKXSAsset_ ? *uuidToKXSAsset_ : kNoAssets;
-  KXSAssetMap::Cursor cursor;
-  for (const KXManagedAssetPtr& asset : *assets) {
-    const OptionalString uuid = asset->uuid();
-    if (!uuid) continue;
-    const KXSAssetMap::Entry* host = hostAssets.find(*uuid, cursor);
-    map.set(host != nullptr ? host->key : Value::string(*uuid), asset);
+  DeviceAssets byUUID(hostAssets());
+  byUUID.reserve(assets->size());
+  for (KXManagedAssetPtr& asset : *assets) {
+    if (const OptionalString uuid = asset->uuid()) byUUID.set(*uuid, std::move(asset));
   }
-  return map;
+  return byUUID;
 }
 
 void KXSyncClient::_reconcileAssets(const DispatchGroupPtr& group) {
-  // Neither depends on the device, so both are made while the transaction before is still at work.
-  hostMemberships_ =
-      std::async(std::launch::async, [assets = uuidToKXSAsset_, containers = albumsAndEvents_] {
-        static const KXSAssetMap kNoAssets;
-        static const KXSItemMap kNoContainers;
-        return Memberships(assets ? *assets : kNoAssets, containers ? *containers : kNoContainers);
-      });
-  computeSortTokens();
+  if (!hostWork_.sortTokens.valid()) startHostWork();
+  sortTokens_.emplace(hostWork_.sortTokens.get());
   submitTransaction(group, [this] { reconcileAssetsInTransaction(); });
-}
-
-void KXSyncClient::computeSortTokens() {
-  sortTokens_.emplace();
-  if (!masterAlbum_ || !uuidToKXSAsset_) return;
-  const std::optional<ArrayView> uuids = masterAlbum_->assetUUIDs();
-  if (!uuids) return;
-  sortTokens_->reserve(uuids->size());
-  KXSAssetMap::Cursor cursor;
-  double previous = kNoPreviousTime;
-  unsigned ties = 0;
-  for (std::size_t i = 0; i < uuids->size(); ++i) {
-    const KXSAssetMap::Entry* found =
-        uuidToKXSAsset_->find(*uuids->stringAt(i, kKXSAlbumAssetUUIDsKey), cursor);
-    if (found == nullptr) continue;
-    const KXSAsset& host = *found->value;
-    const double time = secondsOf(host.exposureDate());
-    ties = std::fabs(previous - time) < kTokenEpsilon ? ties + 1 : 0;
-    const Value key = host.uuidValue();
-    if (!key.isNull()) sortTokens_->set(key, time + ties / kTieStepDivisor);
-    previous = time;
-  }
 }
 
 void KXSyncClient::reconcileAssetsInTransaction() {
   KX_LOG(kClientSource, kReconcileAssets, LogLevel::kInfo, "Transaction for Reconciling Assets");
-  AssetReconciliation run;
   // A failed fetch counts as a device without synced assets.
-  if (std::optional<DeviceAssetMap> assets = _onDeviceAssetsByUUID()) {
-    run.deviceAssets = std::move(*assets);
-  }
+  std::optional<DeviceAssets> assets = _onDeviceAssetsByUUID();
+  if (!assets) assets.emplace(hostAssets());
+  AssetReconciliation run{hostAssets(), std::move(*assets)};
   run.deviceAlbums = _onDeviceAlbumsByUUID();
-  static const KXSAssetMap kNoAssets;
-  run.hostAssets = uuidToKXSAsset_ ? uuidToKXSAsset_.get() : &kNoAssets;
   deleteAssets(run);
   requestNewAssets(run);
   if (!isResync_) updateAssets(run);
 }
 
 void KXSyncClient::deleteAssets(AssetReconciliation& run) {
-  std::vector<Value> doomed;
-  KXSAssetMap::Cursor cursor;
-  for (const auto& entry : run.deviceAssets) {
-    if (isResync_ || run.hostAssets->find(entry.key.stringValue(), cursor) == nullptr) {
-      doomed.push_back(entry.key);
-    }
-  }
-  for (const Value& key : doomed) {
-    const std::string_view uuid = key.stringValue();
-    const KXManagedAssetPtr* found = run.deviceAssets.find(uuid);
-    if (found == nullptr || !*found) {
+  for (DeviceAssets::Entry& entry : run.deviceAssets.entries()) {
+    if (!isResync_ && entry.host != nullptr) continue;
+    const KXManagedAssetPtr asset = std::exchange(entry.asset, nullptr);
+    const std::string_view uuid = entry.uuid();
+    if (!asset) {
       KX_LOG(kClientSource, kReconcileAssets, LogLevel::kWarning, "couldn't find photo with id %@",
              uuid);
       continue;
     }
-    const KXManagedAssetPtr asset = *found;
     deleteWithFaces(*asset);
-    run.deviceAssets.remove(uuid);
     KX_LOG(kClientSource, kReconcileAssets, LogLevel::kInfo, "deleted photo with %@ is %p", uuid,
            static_cast<const void*>(asset.get()));
     asset->deleteObject();
@@ -183,12 +135,11 @@ void KXSyncClient::deleteAssets(AssetReconciliation& run) {
 }
 
 void KXSyncClient::requestNewAssets(AssetReconciliation& run) {
-  DeviceAssetMap::Cursor cursor;
-  for (const auto& entry : *run.hostAssets) {
+  KXSAssetMap::Cursor cursor;
+  for (const KXSAssetMap::Entry& entry : run.hostAssets) {
     const std::string_view uuid = entry.key.stringValue();
-    if (isResync_ || run.deviceAssets.find(uuid, cursor) == nullptr) {
-      requestDownload(uuid, *entry.value);
-    }
+    run.hostAssets.find(uuid, cursor);
+    if (!run.deviceAssets.hasHostAsset(cursor.place())) requestDownload(uuid, *entry.value);
   }
 }
 
@@ -205,36 +156,33 @@ void KXSyncClient::requestDownload(std::string_view uuid, const KXSAsset& host) 
 void KXSyncClient::updateAssets(AssetReconciliation& run) {
   // The assets that both sides have, in row order; all that are left on the device by now.
   std::vector<AssetPair> pairs;
-  pairs.reserve(run.deviceAssets.size());
-  KXSAssetMap::Cursor cursor;
-  for (const auto& entry : run.deviceAssets) {
-    const KXSAssetMap::Entry* host = run.hostAssets->find(entry.key.stringValue(), cursor);
-    if (host != nullptr) pairs.push_back({&entry.value, host, cursor.place()});
+  pairs.reserve(run.deviceAssets.entries().size());
+  for (DeviceAssets::Entry& entry : run.deviceAssets.entries()) {
+    if (entry.asset) pairs.push_back({&entry.asset, entry.host, entry.place});
   }
-  run.memberships = hostMemberships_.get();
+  run.memberships = hostWork_.memberships.get();
   run.memberships->setPairs(pairs);
   for (std::size_t i = 0; i < pairs.size(); ++i) {
     const AssetPair& pair = pairs[i];
     const std::string_view uuid = pair.host->key.stringValue();
     const KXSAsset& host = *pair.host->value;
-    const KXManagedAssetPtr& device = *pair.device;
-    if (deleteAssetIfStale(run, uuid, host, device)) continue;
-    updateSortToken(run, *device, uuid);
+    KXManagedAssetPtr& device = *pair.device;
+    if (deleteAssetIfStale(uuid, host, device)) continue;
+    updateSortToken(*device, pair.place);
     updateLocation(*device, host);
     updateFaces(*device, host);
     updateAlbums(run, i, uuid, device);
   }
 }
 
-bool KXSyncClient::deleteAssetIfStale(AssetReconciliation& run, std::string_view uuid,
-                                      const KXSAsset& host, const KXManagedAssetPtr& present) {
+bool KXSyncClient::deleteAssetIfStale(std::string_view uuid, const KXSAsset& host,
+                                      KXManagedAssetPtr& present) {
   const std::optional<Date> onDevice = present->modificationDate();
-  if (onDevice && onDevice->secondsSinceReference == secondsOf(host.modificationDate())) {
+  if (onDevice && *onDevice == dateWithTesselTimeInterval(host.modificationDate())) {
     return false;
   }
-  const KXManagedAssetPtr device = present;  // which goes with its entry
+  const KXManagedAssetPtr device = std::exchange(present, nullptr);
   KX_LOG(kClientSource, kReconcileAssets, LogLevel::kInfo, "Deleting stale asset: %@", device);
-  run.deviceAssets.remove(uuid);
   deleteWithFaces(*device);
   device->deleteObject();
   KX_LOG(kClientSource, kReconcileAssets, LogLevel::kInfo,
@@ -243,13 +191,11 @@ bool KXSyncClient::deleteAssetIfStale(AssetReconciliation& run, std::string_view
   return true;
 }
 
-void KXSyncClient::updateSortToken(AssetReconciliation& run, KXManagedAsset& device,
-                                   std::string_view uuid) {
-  const auto* found = sortTokens_ ? sortTokens_->find(uuid, run.nextToken) : nullptr;
-  if (found == nullptr) return;
-  const double token = found->value;
+void KXSyncClient::updateSortToken(KXManagedAsset& device, std::size_t place) {
+  const double* token = sortTokens_ ? sortTokens_->at(place) : nullptr;
+  if (token == nullptr) return;
   const std::optional<double> present = device.sortToken();
-  if (!present || std::fabs(*present - token) >= kTokenEpsilon) device.setSortToken(token);
+  if (!present || std::fabs(*present - *token) >= kTokenEpsilon) device.setSortToken(*token);
 }
 
 void KXSyncClient::updateLocation(KXManagedAsset& device, const KXSAsset& host) {

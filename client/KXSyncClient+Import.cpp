@@ -90,8 +90,8 @@ KXSyncSaveJobPtr KXSyncClient::saveJobForRequest(const FRAsset& request) {
   const Coordinate location{orZero(host.latitude()), orZero(host.longitude())};
   if (canUseCoordinate(location)) job->setLocation(location);
   job->setFacesInfo(arrayOf(host.facesInfo()));
-  job->setCreationDate(dateWithTesselTimeInterval(orZero(host.exposureDate())));
-  job->setModificationDate(dateWithTesselTimeInterval(orZero(host.modificationDate())));
+  job->setCreationDate(dateWithTesselTimeInterval(host.exposureDate()));
+  job->setModificationDate(dateWithTesselTimeInterval(host.modificationDate()));
   const double* token = sortTokens_ ? sortTokens_->find(request.identifier()) : nullptr;
   job->setSortToken(token != nullptr ? std::optional<double>(*token) : std::nullopt);
   if (const OptionalString name = host.originalFileName()) {

@@ -25,6 +25,17 @@ bool isMasterAlbum(const KXSItem* item) {
   return subclass && subclass->int64Value() == kMasterAlbumSubclass;
 }
 
+// Takes the first master album out of the items. Null when there is none.
+KXSAlbumPtr takeMasterAlbum(KXSItemMap& items) {
+  for (const auto& entry : items) {
+    if (!isMasterAlbum(entry.value.get())) continue;
+    auto master = std::static_pointer_cast<KXSAlbum>(entry.value);
+    if (const OptionalString uuid = master->uuid()) items.remove(*uuid);
+    return master;
+  }
+  return nullptr;
+}
+
 }  // namespace
 
 bool KXSyncClient::reconcileSync(std::uint32_t syncType, const std::string& newAnchor,
@@ -53,10 +64,12 @@ bool KXSyncClient::reconcileSync(std::uint32_t syncType, const std::string& newA
     }
     return false;
   }
-  _initializeOutstandingAssets();
-
   std::optional<std::string> previousUUID;
   const bool isNullSync = equalsPreviousSnapshot(*snapshot, previous.get(), &previousUUID);
+  // The library may be at work for long before it answers what follows.
+  if (!isNullSync) startHostWork(*snapshot);
+  _initializeOutstandingAssets();
+
   const bool isResync = decideResync(previousUUID, *snapshot);
   Dictionary current;
   current.setIfPresent(kLibraryUUID, Value::optionalString(snapshot->libraryUUID()));
@@ -163,6 +176,18 @@ bool KXSyncClient::decideResync(OptionalString previousUUID,
   return true;
 }
 
+void KXSyncClient::startHostWork(const KXSLibraryChangeSnapshot& snapshot) {
+  const KXSItemMapPtr& items = snapshot.albumsAndEventsByUUID();
+  const auto containers = items ? std::make_shared<KXSItemMap>(*items) : nullptr;
+  KXSAlbumPtr master = containers ? takeMasterAlbum(*containers) : nullptr;
+  hostWork_ = HostWork::start(containers, master ? master : masterAlbum_, snapshot.assetsByUUID());
+}
+
+// For a step that is taken by itself.
+void KXSyncClient::startHostWork() {
+  hostWork_ = HostWork::start(albumsAndEvents_, masterAlbum_, uuidToKXSAsset_);
+}
+
 void KXSyncClient::reconcileSnapshot(const KXSLibraryChangeSnapshotPtr& snapshot, bool isResync) {
   // An interrupted sync must never be taken for a null sync the next time.
   platform_.files().removeItem(KXPreviousMetadataSyncFilePath, nullptr);
@@ -181,15 +206,7 @@ void KXSyncClient::reconcileSnapshot(const KXSLibraryChangeSnapshotPtr& snapshot
 
 void KXSyncClient::_pullOutMasterAlbumFromAlbumsAndEvents() {
   if (!albumsAndEvents_) return;
-  KXSAlbumPtr found;
-  for (const auto& entry : *albumsAndEvents_) {
-    if (!isMasterAlbum(entry.value.get())) continue;
-    found = std::static_pointer_cast<KXSAlbum>(entry.value);
-    break;
-  }
-  if (!found) return;
-  masterAlbum_ = found;
-  if (const OptionalString uuid = found->uuid()) albumsAndEvents_->remove(*uuid);
+  if (KXSAlbumPtr master = takeMasterAlbum(*albumsAndEvents_)) masterAlbum_ = std::move(master);
 }
 
 void KXSyncClient::_reconcileMetadata() {

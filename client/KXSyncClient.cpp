@@ -124,6 +124,7 @@ void KXSyncClient::_clearSyncState() {
   albumURIs_ = std::nullopt;
   masterAlbum_ = nullptr;
   sortTokens_ = std::nullopt;
+  hostWork_ = {};
   restoreGroups_ = nullptr;
   restoreContext_ = std::nullopt;
   syncRequested_ = false;

@@ -12,8 +12,8 @@
 
 #include "client/BlockFailure.h"
 #include "client/ContainerIndex.h"
+#include "client/HostWork.h"
 #include "client/KXSyncAssetGroup.h"
-#include "client/Memberships.h"
 #include "client/TransferList.h"
 #include "platform/Platform.h"
 #include "platform/foundation/OrderedMap.h"
@@ -34,6 +34,8 @@ inline constexpr std::int64_t kKXErrorNoSnapshot = -2;  // domain kBundleIdentif
 // fixed set of codes.
 bool isRecoverableTransferError(const Error& error);
 
+class DeviceAssets;
+
 // The plug-in's principal class: syncs, restores and measures the device's photo library as the
 // sync daemon asks. Threads: called on the daemon's plug-in queue, one call at a time, and
 // destroyed there; it blocks that queue while the library works. Lifetime: the platform outlives
@@ -42,7 +44,6 @@ bool isRecoverableTransferError(const Error& error);
 class KXSyncClient final : public FRClient {
  public:
   using DeviceAlbumMap = OrderedMap<KXGenericAlbumPtr>;
-  using DeviceAssetMap = OrderedMap<KXManagedAssetPtr>;
   using SaveJobs = std::vector<KXSyncSaveJobPtr>;
   using AssetGroupMap = OrderedMap<std::shared_ptr<KXSyncAssetGroup>>;
   // UUID to path of the main file, of every asset whose files are not all present.
@@ -94,7 +95,7 @@ class KXSyncClient final : public FRClient {
   void setAlbumsAndEvents(KXSItemMapPtr items);
   const KXPhotoLibraryPtr& library() const { return library_; }
   const DispatchGroupPtr& libraryGroup() const { return libraryGroup_; }
-  const std::optional<OrderedMap<double>>& assetUUIDtoSortToken() const { return sortTokens_; }
+  const std::optional<SortTokens>& assetUUIDtoSortToken() const { return sortTokens_; }
   const std::optional<OrderedMap<std::string>>& albumUUIDToObjectIDMap() const {
     return albumURIs_;
   }
@@ -128,7 +129,7 @@ class KXSyncClient final : public FRClient {
   void _createAlbumUUIDToObjectIDMap(const DispatchGroupPtr& group);
   // The following ones run on the library's queue.
   // Null when the fetch failed.
-  std::optional<DeviceAssetMap> _onDeviceAssetsByUUID();
+  std::optional<DeviceAssets> _onDeviceAssetsByUUID();
   DeviceAlbumMap _onDeviceAlbumsByUUID();
   KXGenericAlbumPtr _addAlbumNamed(OptionalString name, std::string_view uuid,
                                    std::int32_t kindValue);
@@ -194,6 +195,8 @@ class KXSyncClient final : public FRClient {
                               const PreviousSnapshot& previous,
                               std::optional<std::string>* libraryUUID);
   bool decideResync(OptionalString previousUUID, const KXSLibraryChangeSnapshot& snapshot);
+  void startHostWork(const KXSLibraryChangeSnapshot& snapshot);
+  void startHostWork();
   void reconcileSnapshot(const KXSLibraryChangeSnapshotPtr& snapshot, bool isResync);
   void writeDictionary(const std::string& path, Dictionary dictionary);
   Value readDictionary(const std::string& path);
@@ -205,14 +208,15 @@ class KXSyncClient final : public FRClient {
   void submitBlock(const DispatchGroupPtr& group, Block block);
 
   // Asset reconciliation.
-  void computeSortTokens();
+  const KXSAssetMap& hostAssets() const;
   void reconcileAssetsInTransaction();
   void deleteAssets(AssetReconciliation& run);
   void requestNewAssets(AssetReconciliation& run);
   void updateAssets(AssetReconciliation& run);
-  bool deleteAssetIfStale(AssetReconciliation& run, std::string_view uuid, const KXSAsset& host,
-                          const KXManagedAssetPtr& present);
-  void updateSortToken(AssetReconciliation& run, KXManagedAsset& device, std::string_view uuid);
+  // Takes the asset away when it does.
+  bool deleteAssetIfStale(std::string_view uuid, const KXSAsset& host, KXManagedAssetPtr& present);
+  // By the host's asset's place.
+  void updateSortToken(KXManagedAsset& device, std::size_t place);
   void updateLocation(KXManagedAsset& device, const KXSAsset& host);
   void updateFaces(KXManagedAsset& device, const KXSAsset& host);
   void updateAlbums(AssetReconciliation& run, std::size_t index, std::string_view uuid,
@@ -221,7 +225,6 @@ class KXSyncClient final : public FRClient {
 
   // Album reconciliation.
   void reconcileAlbumsInTransaction();
-  static std::vector<std::uint8_t> assetOrderBytes(const KXSItemMapPtr& albumsAndEvents);
   static DeviceAlbumMap onDeviceAlbumsByUUID(KXPhotoLibrary& library);
   std::vector<Value> deleteAlbums(DeviceAlbumMap& onDevice);
   bool deleteAlbum(DeviceAlbumMap& onDevice, std::string_view uuid);
@@ -267,12 +270,11 @@ class KXSyncClient final : public FRClient {
   std::optional<SaveJobs> outstandingSyncJobs_;
   KXSAssetMapPtr uuidToKXSAsset_;
   std::optional<OrderedMap<std::string>> albumURIs_;  // albumUUIDToObjectIDMap
-  std::optional<OrderedMap<double>> sortTokens_;      // assetUUIDtoSortToken
+  std::optional<SortTokens> sortTokens_;              // assetUUIDtoSortToken
   KXSLibraryChangeSnapshotPtr snapshot_;              // libraryChangeSnapshot
   std::optional<OrderedMap<unsigned>> pendingAssetsPerContainer_;
-  std::future<std::vector<std::uint8_t>> assetOrder_;  // for the coming album reconciliation
-  std::future<Memberships> hostMemberships_;           // for the coming asset reconciliation
-  std::shared_ptr<AssetGroupMap> restoreGroups_;       // restorePathToAssetGroup
+  HostWork hostWork_;                             // for the coming reconciliation
+  std::shared_ptr<AssetGroupMap> restoreGroups_;  // restorePathToAssetGroup
   std::optional<Dictionary> restoreContext_;
   bool syncRequested_ = false;
   std::optional<ContainerIndex> containerIndex_;  // of albumsAndEvents_, made at the first import

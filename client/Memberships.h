@@ -13,10 +13,10 @@
 
 namespace kx {
 
-// One synced asset that host and device both have: the device's, in a map that outlives this, and
+// One synced asset that host and device both have: the device's, in a list that outlives this, and
 // the host's with its place in the map of the host's assets.
 struct AssetPair {
-  const KXManagedAssetPtr* device = nullptr;
+  KXManagedAssetPtr* device = nullptr;
   const KXSAssetMap::Entry* host = nullptr;
   std::size_t place = 0;
 };

@@ -162,10 +162,10 @@ bool SyncSession::putSnapshotInPlace() {
   if (!error && !context_.plan) staging_ = Staging::open(context_.options.deviceRoot, &error);
   if (staging_) staging_->clear();
   // A file that holds these bytes already is left as it is.
-  if (!error) files_.writeFileAtomically(kKXSnapshotPath, snapshot_.bytes->span(), &error);
-  // It has served, and of a large library it is a good part of our memory.
+  if (!error) files_.writeDataAtomically(kKXSnapshotPath, snapshot_.bytes, &error);
+  // The bytes are kept for the plug-in, which reads this file. The rest has served.
   if (snapshot_.checked) libraryUUID_ = std::move(snapshot_.checked->libraryUUID);
-  snapshot_ = {};
+  snapshot_.checked.reset();
   if (error) fail(prefixed("the snapshot cannot be put on the device", *error));
   return error == nullptr;
 }
@@ -210,6 +210,7 @@ bool SyncSession::reconcile() {
   }
   ErrorPtr error;
   const bool reconciled = callReconcile(&error);
+  snapshot_ = {};
   context_.device.stopReadingAhead();
   settleLibrarySwitch(reconciled);
   if (!reconciled) {

@@ -3,26 +3,27 @@
 #include <cerrno>
 
 #include "device/DeviceLayout.h"
+#include "platform/foundation/Hash.h"
 #include "platform/foundation/PropertyList.h"
 
 namespace kx {
 namespace {
 
-// FNV-1a, which stays the same from run to run: tags are kept in the database.
-void mix(std::uint64_t* hash, std::uint8_t byte) { *hash = (*hash ^ byte) * 0x100000001b3ULL; }
+// Tags are kept in the database, so the seed stays. With another one, or another way to hash, every
+// album is looked through once more.
+constexpr HashSeed kTagSeed{0xcbf29ce484222325ULL, 0x100000001b3ULL};
 
 }  // namespace
 
 AssetOrder::Album::Album(DictionaryView indexes) : indexes_(std::move(indexes)) {
-  std::uint64_t hash = 0xcbf29ce484222325ULL;
+  std::uint64_t tag = indexes_->size();
   for (std::size_t i = 0; i < indexes_->size(); ++i) {
-    for (const char c : indexes_->keyAt(i)) mix(&hash, static_cast<std::uint8_t>(c));
+    const std::string_view uuid = indexes_->keyAt(i);
     const Value value = indexes_->valueAt(i);
     const std::uint64_t index = value.isNumber() ? value.numberValue().uint64Value() : 0;
-    for (int shift = 0; shift < 64; shift += 8)
-      mix(&hash, static_cast<std::uint8_t>(index >> shift));
+    tag = hashNumber(hashBytes(uuid.data(), uuid.size(), kTagSeed) ^ tag, index, kTagSeed);
   }
-  tag_ = static_cast<std::int64_t>(hash | 1U);
+  tag_ = static_cast<std::int64_t>(tag | 1U);
 }
 
 std::optional<std::int64_t> AssetOrder::Album::indexOf(std::string_view assetUUID) const {

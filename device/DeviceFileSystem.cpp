@@ -20,6 +20,19 @@ std::string identifierOf(const struct stat& status) {
   return std::to_string(status.st_dev) + ":" + std::to_string(status.st_ino);
 }
 
+// Smaller files are not worth it.
+constexpr std::size_t kLeastShared = std::size_t{1} << 20;
+
+bool isSame(const timespec& a, const timespec& b) {
+  return a.tv_sec == b.tv_sec && a.tv_nsec == b.tv_nsec;
+}
+
+// Whether nothing can have changed the file between the two.
+bool isSame(const struct stat& a, const struct stat& b) {
+  return a.st_dev == b.st_dev && a.st_ino == b.st_ino && a.st_size == b.st_size &&
+         isSame(a.st_mtim, b.st_mtim) && isSame(a.st_ctim, b.st_ctim);
+}
+
 class HeldLock : public FileLock {
  public:
   explicit HeldLock(UniqueFd fd) : fd_(std::move(fd)) {}
@@ -78,9 +91,32 @@ bool DeviceFileSystem::fileExists(const std::string& path) {
 }
 
 DataPtr DeviceFileSystem::readFile(const std::string& path, ErrorPtr* error) {
+  if (DataPtr bytes = shared(path)) return bytes;
+  struct stat status;
+  const bool isThere = root_->status(path, &status) == 0;
   std::vector<std::uint8_t> bytes;
   if (!done(path, root_->readFile(path, &bytes), error)) return nullptr;
-  return std::make_shared<const Data>(std::move(bytes));
+  auto data = std::make_shared<const Data>(std::move(bytes));
+  if (isThere) share(path, status, data);
+  return data;
+}
+
+DataPtr DeviceFileSystem::shared(const std::string& path) const {
+  const std::lock_guard<std::mutex> lock(sharedMutex_);
+  const auto known = shared_.find(path);
+  DataPtr bytes = known == shared_.end() ? nullptr : known->second.bytes.lock();
+  struct stat status;
+  if (!bytes || root_->status(path, &status) != 0) return nullptr;
+  return isSame(status, known->second.status) ? bytes : nullptr;
+}
+
+// The status is one that the file had not later than with these bytes.
+void DeviceFileSystem::share(const std::string& path, const struct stat& status,
+                             const DataPtr& bytes) {
+  if (bytes->length() < kLeastShared) return;
+  const std::lock_guard<std::mutex> lock(sharedMutex_);
+  std::erase_if(shared_, [](const auto& entry) { return entry.second.bytes.expired(); });
+  shared_[path] = {status, bytes};
 }
 
 bool DeviceFileSystem::fileHolds(const std::string& path, std::span<const std::uint8_t> bytes) {
@@ -90,6 +126,40 @@ bool DeviceFileSystem::fileHolds(const std::string& path, std::span<const std::u
 bool DeviceFileSystem::writeFileAtomically(const std::string& path,
                                            std::span<const std::uint8_t> bytes, ErrorPtr* error) {
   return done(path, readOnly_ ? EROFS : root_->writeAtomically(path, bytes), error);
+}
+
+bool DeviceFileSystem::writeDataAtomically(const std::string& path, const DataPtr& bytes,
+                                           ErrorPtr* error) {
+  struct stat status;
+  const int failed = readOnly_ ? EROFS : root_->writeAtomically(path, bytes->span(), &status);
+  if (!done(path, failed, error)) return false;
+  share(path, status, bytes);
+  return true;
+}
+
+class DeviceFileSystem::Prepared : public PreparedFile {
+ public:
+  Prepared(DeviceFileSystem& files, std::string path, DataPtr bytes)
+      : files_(files), path_(std::move(path)), bytes_(std::move(bytes)) {
+    isReady_ = files_.root_->writeTemporary(path_, bytes_->span(), &file_) == 0;
+  }
+  bool putInPlace(ErrorPtr* error) override {
+    if (!isReady_) return files_.writeDataAtomically(path_, bytes_, error);
+    return files_.done(path_, file_.putInPlace(), error);
+  }
+
+ private:
+  DeviceFileSystem& files_;
+  const std::string path_;
+  const DataPtr bytes_;
+  TemporaryFile file_;
+  bool isReady_ = false;
+};
+
+std::unique_ptr<FileSystem::PreparedFile> DeviceFileSystem::prepareFile(const std::string& path,
+                                                                        DataPtr bytes) {
+  if (readOnly_) return FileSystem::prepareFile(path, std::move(bytes));
+  return std::make_unique<Prepared>(*this, path, std::move(bytes));
 }
 
 bool DeviceFileSystem::removeItem(const std::string& path, ErrorPtr* error) {

@@ -256,12 +256,18 @@ int DeviceRoot::readFile(const std::string& path, std::vector<std::uint8_t>* out
   return readAll(fd.get(), out);
 }
 
-bool DeviceRoot::fileHolds(const std::string& path, std::span<const std::uint8_t> bytes) const {
+bool DeviceRoot::fileHolds(const std::string& path, std::span<const std::uint8_t> bytes,
+                           struct stat* status) const {
   struct stat present;
+  const auto mayHold = [&] {
+    return S_ISREG(present.st_mode) && static_cast<std::size_t>(present.st_size) == bytes.size();
+  };
   UniqueFd fd;
-  return status(path, &present) == 0 && S_ISREG(present.st_mode) &&
-         static_cast<std::size_t>(present.st_size) == bytes.size() &&
-         resolve(path, O_RDONLY | O_NONBLOCK, 0, &fd) == 0 && holds(fd.get(), bytes);
+  if (this->status(path, &present) != 0 || !mayHold()) return false;
+  if (resolve(path, O_RDONLY | O_NONBLOCK, 0, &fd) != 0) return false;
+  if (::fstat(fd.get(), &present) != 0 || !mayHold() || !holds(fd.get(), bytes)) return false;
+  if (status != nullptr) *status = present;
+  return true;
 }
 
 int DeviceRoot::makeDirectories(const std::string& path) const {
@@ -282,27 +288,47 @@ int DeviceRoot::makeDirectories(const std::string& path) const {
   return S_ISDIR(made.st_mode) ? 0 : ENOTDIR;
 }
 
-int DeviceRoot::writeAtomically(const std::string& path,
-                                std::span<const std::uint8_t> bytes) const {
-  UniqueFd parent;
-  std::string leaf;
-  if (const int bad = openParent(path, &parent, &leaf); bad != 0) return bad;
-  if (fileHolds(path, bytes)) return 0;
-  const std::string temporary = temporaryName();
-  UniqueFd file(::openat(parent.get(), temporary.c_str(),
+TemporaryFile::~TemporaryFile() {
+  if (!name_.empty()) ::unlinkat(parent_.get(), name_.c_str(), 0);
+}
+
+int TemporaryFile::putInPlace() {
+  if (name_.empty()) return ENOENT;
+  if (::renameat(parent_.get(), name_.c_str(), parent_.get(), leaf_.c_str()) != 0) return errno;
+  name_.clear();
+  // The renaming has changed its status. Whatever else is there now is not what was written.
+  struct stat renamed;
+  const bool isSame = ::fstatat(parent_.get(), leaf_.c_str(), &renamed, AT_SYMLINK_NOFOLLOW) == 0 &&
+                      renamed.st_ino == status_.st_ino && renamed.st_size == status_.st_size &&
+                      renamed.st_mtim.tv_sec == status_.st_mtim.tv_sec &&
+                      renamed.st_mtim.tv_nsec == status_.st_mtim.tv_nsec;
+  if (isSame) status_ = renamed;
+  return ::fsync(parent_.get()) == 0 ? 0 : errno;
+}
+
+int DeviceRoot::writeTemporary(const std::string& path, std::span<const std::uint8_t> bytes,
+                               TemporaryFile* out) const {
+  if (const int bad = openParent(path, &out->parent_, &out->leaf_); bad != 0) return bad;
+  const std::string name = temporaryName();
+  UniqueFd file(::openat(out->parent_.get(), name.c_str(),
                          O_CREAT | O_EXCL | O_WRONLY | O_CLOEXEC | O_NOFOLLOW, kFileMode));
   if (!file) return errno;
+  out->name_ = name;
   int failed = writeAll(file.get(), bytes);
   if (failed == 0 && ::fsync(file.get()) != 0) failed = errno;
+  if (failed == 0 && ::fstat(file.get(), &out->status_) != 0) failed = errno;
   if (const int closing = file.close(); failed == 0) failed = closing;
-  if (failed == 0 && ::renameat(parent.get(), temporary.c_str(), parent.get(), leaf.c_str()) != 0) {
-    failed = errno;
-  }
-  if (failed != 0) {
-    ::unlinkat(parent.get(), temporary.c_str(), 0);
-    return failed;
-  }
-  return ::fsync(parent.get()) == 0 ? 0 : errno;
+  return failed;
+}
+
+int DeviceRoot::writeAtomically(const std::string& path, std::span<const std::uint8_t> bytes,
+                                struct stat* status) const {
+  if (fileHolds(path, bytes, status)) return 0;
+  TemporaryFile file;
+  int failed = writeTemporary(path, bytes, &file);
+  if (failed == 0) failed = file.putInPlace();
+  if (failed == 0 && status != nullptr) *status = file.status_;
+  return failed;
 }
 
 int DeviceRoot::remove(const std::string& path) const {

@@ -35,6 +35,25 @@ class UniqueFd {
   int fd_ = -1;
 };
 
+// A file that is written and synced beside the place where it is to be; removed when it goes before
+// it is put there.
+class TemporaryFile {
+ public:
+  TemporaryFile() = default;
+  TemporaryFile(const TemporaryFile&) = delete;
+  TemporaryFile& operator=(const TemporaryFile&) = delete;
+  ~TemporaryFile();
+  // Renames it and syncs the directory: 0, or an errno. Once.
+  [[nodiscard]] int putInPlace();
+
+ private:
+  friend class DeviceRoot;
+  UniqueFd parent_;
+  std::string name_;  // empty: there is none
+  std::string leaf_;
+  struct stat status_ = {};  // as it was written; once in place, as it was put there
+};
+
 // The directory that stands for the device's root, held open. Every device path is resolved beneath
 // it, component by component or by the kernel, and no link is ever followed on the way, not even by
 // the last component. Results of type int are 0 or an errno; paths are absolute device paths,
@@ -55,14 +74,20 @@ class DeviceRoot {
   [[nodiscard]] int openFile(const std::string& path, int flags, UniqueFd* out) const;
   [[nodiscard]] int status(const std::string& path, struct stat* out) const;  // of a link itself
   [[nodiscard]] int readFile(const std::string& path, std::vector<std::uint8_t>* out) const;
-  // Whether a regular file is there that can be read and holds just these bytes.
-  bool fileHolds(const std::string& path, std::span<const std::uint8_t> bytes) const;
+  // Whether a regular file is there that can be read and holds just these bytes, and its status
+  // before they were compared.
+  bool fileHolds(const std::string& path, std::span<const std::uint8_t> bytes,
+                 struct stat* status = nullptr) const;
   // Makes missing directories and syncs what they lie in.
   [[nodiscard]] int makeDirectories(const std::string& path) const;
   // The one way to replace a state file: temporary file in the same directory, fsync, rename, fsync
-  // of the directory. Nothing is written when the file holds these bytes already.
-  [[nodiscard]] int writeAtomically(const std::string& path,
-                                    std::span<const std::uint8_t> bytes) const;
+  // of the directory. The first two by themselves:
+  [[nodiscard]] int writeTemporary(const std::string& path, std::span<const std::uint8_t> bytes,
+                                   TemporaryFile* out) const;
+  // All of them. Nothing is written when the file holds these bytes already. The status is that of
+  // a file that held them.
+  [[nodiscard]] int writeAtomically(const std::string& path, std::span<const std::uint8_t> bytes,
+                                    struct stat* status = nullptr) const;
   // A file or an empty directory.
   [[nodiscard]] int remove(const std::string& path) const;
   // Fails with EEXIST when `to` is there.

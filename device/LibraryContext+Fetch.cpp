@@ -42,6 +42,38 @@ bool wantsEqual(const AssetPredicate& predicate) {
   return predicate.comparison == AssetPredicate::Comparison::kSavedAssetTypeEquals;
 }
 
+// Makes one list of albums after the other, many of them in one piece of memory.
+class AlbumLists {
+ public:
+  void add(const std::shared_ptr<StoredAlbum>& album) {
+    if (first_ + count_ == room_) begin();
+    piece_[first_ + count_++] = album;
+  }
+  // Ends a list and tells its length.
+  std::uint32_t end(std::shared_ptr<const KXGenericAlbumPtr[]>* list) {
+    *list = {piece_, piece_.get() + first_};
+    first_ += count_;
+    return static_cast<std::uint32_t>(std::exchange(count_, 0));
+  }
+
+ private:
+  static constexpr std::size_t kPiece = 4096;
+
+  // A new piece, to which the list at hand moves.
+  void begin() {
+    room_ = std::max(kPiece, 2 * count_);
+    const auto piece = std::make_shared<KXGenericAlbumPtr[]>(room_);
+    std::move(piece_.get() + first_, piece_.get() + first_ + count_, piece.get());
+    piece_ = piece;
+    first_ = 0;
+  }
+
+  std::shared_ptr<KXGenericAlbumPtr[]> piece_;
+  std::size_t room_ = 0;
+  std::size_t first_ = 0;  // of the list at hand
+  std::size_t count_ = 0;
+};
+
 std::vector<std::int64_t> sizes(SqliteStatement& row) {
   std::vector<std::int64_t> found;
   while (row.step()) found.push_back(row.integerAt(0));
@@ -158,17 +190,16 @@ void LibraryContext::prefetchAlbums(const std::vector<KXManagedAssetPtr>& assets
   SqliteStatement row(store_->database(),
                       "SELECT asset, album FROM memberships ORDER BY asset, album");
   bool more = nextRow(row);
-  std::vector<KXGenericAlbumPtr> found;
+  AlbumLists lists;
   for (const KXManagedAssetPtr& object : assets) {
     StoredAsset& owner = static_cast<StoredAsset&>(*object);
     while (more && row.integerAt(0) < owner.pk_) more = nextRow(row);
     if (owner.relationsChanged_) continue;
-    found.clear();
     for (; more && row.integerAt(0) == owner.pk_; more = nextRow(row)) {
       const std::shared_ptr<StoredAlbum>& holder = albums_.at(row.integerAt(1));
-      if (!holder->isDeleted()) found.push_back(holder);
+      if (!holder->isDeleted()) lists.add(holder);
     }
-    owner.albums_.assign(found.begin(), found.end());
+    owner.albumCount_ = lists.end(&owner.albums_);
     owner.albumsRead_ = true;
     owner.albumsEpoch_ = albumsEpoch_;
   }

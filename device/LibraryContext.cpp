@@ -41,13 +41,13 @@ std::shared_ptr<StoredAlbum> LibraryContext::album(RowId pk, const SqliteStateme
 
 std::shared_ptr<StoredAsset> LibraryContext::asset(RowId pk) {
   std::shared_ptr<StoredAsset>& entry = assets_.at(pk);
-  if (!entry) entry = std::make_shared<StoredAsset>(this, pk);
+  if (!entry) entry = blocks_.make<StoredAsset>(this, pk);
   return entry;
 }
 
 std::shared_ptr<StoredFace> LibraryContext::face(RowId pk, RowId asset) {
   std::shared_ptr<StoredFace>& entry = faces_.at(pk);
-  if (!entry) entry = std::make_shared<StoredFace>(this, pk, asset);
+  if (!entry) entry = blocks_.make<StoredFace>(this, pk, asset);
   return entry;
 }
 

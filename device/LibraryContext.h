@@ -15,6 +15,7 @@
 #include "device/StoredAlbum.h"
 #include "device/StoredAlbumList.h"
 #include "device/StoredAsset.h"
+#include "platform/foundation/RecordBlocks.h"
 #include "platform/library/KXPhotoLibrary.h"
 
 namespace kx {
@@ -116,6 +117,7 @@ class LibraryContext : public KXManagedObjectContext {
   void dropChangesOf(StoredAsset& asset);
 
   const std::shared_ptr<LibraryStore> store_;
+  RecordBlocks blocks_;  // of assets and faces
   RowRegistry<StoredAsset> assets_;
   RowRegistry<StoredFace> faces_;
   RowRegistry<StoredAlbum> albums_;

@@ -81,7 +81,7 @@ INSERT INTO albums(kind, pending_type, pending_count, managed, role)
 
 constexpr const char* kConnectionSettings =
     "PRAGMA foreign_keys=ON; PRAGMA cell_size_check=ON; PRAGMA mmap_size=0; "
-    "PRAGMA cache_size=-32768; PRAGMA temp_store=MEMORY;";
+    "PRAGMA cache_size=-12288; PRAGMA temp_store=MEMORY;";
 // A rollback journal, removed and its directory synced with every commit: the write-ahead log of
 // SQLite before 3.51.3 may lose its way when a checkpoint meets a restart of the log.
 constexpr const char* kWriterSettings =

@@ -159,6 +159,17 @@ bool OverlayFileSystem::fileHolds(const std::string& path, std::span<const std::
 
 bool OverlayFileSystem::writeFileAtomically(const std::string& path,
                                             std::span<const std::uint8_t> bytes, ErrorPtr* error) {
+  return write(path, bytes, nullptr, error);
+}
+
+bool OverlayFileSystem::writeDataAtomically(const std::string& path, const DataPtr& bytes,
+                                            ErrorPtr* error) {
+  return write(path, bytes->span(), bytes, error);
+}
+
+// Keeps the data object if there is one, else a copy of the bytes.
+bool OverlayFileSystem::write(const std::string& path, std::span<const std::uint8_t> bytes,
+                              DataPtr data, ErrorPtr* error) {
   int failed = DeviceRoot::checkPath(path);
   if (failed == 0 && path == "/") failed = EINVAL;
   const std::lock_guard<std::mutex> lock(mutex_);
@@ -168,7 +179,7 @@ bool OverlayFileSystem::writeFileAtomically(const std::string& path,
   const Entry* entry = find(path);
   const bool same = entry != nullptr && entry->kind == Kind::kFile &&
                     std::ranges::equal(entry->bytes->span(), bytes);
-  if (!same) put(path, Kind::kFile, keep(bytes));
+  if (!same) put(path, Kind::kFile, data ? std::move(data) : keep(bytes));
   return true;
 }
 

@@ -23,6 +23,7 @@ class OverlayFileSystem final : public FileSystem {
   bool fileHolds(const std::string& path, std::span<const std::uint8_t> bytes) override;
   bool writeFileAtomically(const std::string& path, std::span<const std::uint8_t> bytes,
                            ErrorPtr* error) override;
+  bool writeDataAtomically(const std::string& path, const DataPtr& bytes, ErrorPtr* error) override;
   bool removeItem(const std::string& path, ErrorPtr* error) override;
   bool createDirectoryWithIntermediates(const std::string& path, ErrorPtr* error) override;
   std::vector<std::string> contentsOfDirectory(const std::string& path, ErrorPtr* error) override;
@@ -58,6 +59,8 @@ class OverlayFileSystem final : public FileSystem {
   void put(const std::string& path, Kind kind, DataPtr bytes);
   // Bytes that are kept already are not kept twice.
   DataPtr keep(std::span<const std::uint8_t> bytes) const;
+  bool write(const std::string& path, std::span<const std::uint8_t> bytes, DataPtr data,
+             ErrorPtr* error);
   std::string identifierOf(const std::string& path) const;
 
   struct Level;

@@ -59,6 +59,7 @@ class Quarryd {
  private:
   struct Import;
   struct HandOver;
+  struct Expected;
 
   void work(HandOver& handOver, const std::vector<DataPtr>& jobs);
   void workJob(HandOver& handOver, const DataPtr& job);
@@ -77,7 +78,7 @@ class Quarryd {
   // Clean-up and seal.
   [[nodiscard]] ErrorPtr cleanUp(const HandOver& handOver, const std::optional<Date>& before);
   [[nodiscard]] ErrorPtr seal(const std::string& snapshotPath);
-  [[nodiscard]] std::optional<std::string> whyNotWhole(const DataPtr& snapshot);
+  [[nodiscard]] std::optional<std::string> whyNotWhole(const DataPtr& snapshot, Expected* expected);
   [[nodiscard]] std::optional<std::string> whyNotInLibrary(SnapshotAssets wanted);
 
   // Restores.
@@ -94,7 +95,6 @@ class Quarryd {
   std::atomic<bool> leftFilesBehind_{false};
   std::atomic<bool> restoring_{false};
   std::mutex restoredMutex_;
-  struct Expected;
   std::shared_ptr<Expected> expected_;  // read ahead for the next seal; on the work queue
   std::vector<std::string> restored_;   // assets with new files that nobody has looked at yet
   DispatchQueuePtr completions_;

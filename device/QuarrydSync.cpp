@@ -25,11 +25,13 @@ int errnoOf(bool done, const ErrorPtr& error) {
 
 }  // namespace
 
-// A snapshot with the assets that it lists. Texts are those of the root.
+// A snapshot with the assets that it lists, and what is to become the seal. Texts are those of the
+// root.
 struct Quarryd::Expected {
   DataPtr bytes;
   Value root;
   SnapshotAssets assets;
+  std::unique_ptr<FileSystem::PreparedFile> seal;
 };
 
 ErrorPtr Quarryd::cleanUp(const HandOver& handOver, const std::optional<Date>& before) {
@@ -68,15 +70,16 @@ void Quarryd::expectSeal() {
     const Value root = readPropertyList(bytes, nullptr);
     auto assets = root.isDictionary() ? SnapshotAssets::of(root, &ignored) : std::nullopt;
     // What makes no sense is told of when the seal is asked for.
-    if (assets) expected_.reset(new Expected{std::move(bytes), root, std::move(*assets)});
+    if (!assets) return;
+    auto seal = files_.prepareFile(device_paths::kLastSynced, bytes);
+    expected_.reset(new Expected{std::move(bytes), root, std::move(*assets), std::move(seal)});
   });
 }
 
-std::optional<std::string> Quarryd::whyNotWhole(const DataPtr& snapshot) {
-  const std::shared_ptr<Expected> expected = std::move(expected_);
+std::optional<std::string> Quarryd::whyNotWhole(const DataPtr& snapshot, Expected* expected) {
   if (restoring_) return "a restore is under way";
   if (parts_.store->health().anyFailure()) return "something failed since the sync began";
-  if (expected && expected->bytes == snapshot) return whyNotInLibrary(std::move(expected->assets));
+  if (expected != nullptr) return whyNotInLibrary(std::move(expected->assets));
   ErrorPtr unreadable;
   const Value root = readPropertyList(snapshot, &unreadable);
   if (!root.isDictionary()) {
@@ -122,11 +125,10 @@ std::optional<std::string> Quarryd::whyNotInLibrary(SnapshotAssets wanted) {
 ErrorPtr Quarryd::seal(const std::string& snapshotPath) {
   LibraryStore& store = *parts_.store;
   ErrorPtr error;
-  // Bytes that were read ahead are the ones, while the file still holds them.
-  DataPtr snapshot = expected_ ? expected_->bytes : nullptr;
-  if (!snapshot || !files_.fileHolds(snapshotPath, snapshot->span())) {
-    snapshot = files_.readFile(snapshotPath, &error);
-  }
+  // What was read ahead counts while the file still holds it.
+  std::shared_ptr<Expected> expected = std::move(expected_);
+  if (expected && !files_.fileHolds(snapshotPath, expected->bytes->span())) expected.reset();
+  const DataPtr snapshot = expected ? expected->bytes : files_.readFile(snapshotPath, &error);
   if (!snapshot) {
     store.log().failure("the sync is not sealed",
                         systemError("cannot read", snapshotPath, errnoOf(false, error)));
@@ -135,13 +137,14 @@ ErrorPtr Quarryd::seal(const std::string& snapshotPath) {
   if (files_.fileHolds(device_paths::kLastSynced, snapshot->span())) {
     return nullptr;  // proved before, and nothing has been taken back since
   }
-  if (const std::optional<std::string> why = whyNotWhole(snapshot)) {
+  if (const std::optional<std::string> why = whyNotWhole(snapshot, expected.get())) {
     store.log().write(LogLevel::kWarning, "the sync is not sealed: " + *why);
     return nullptr;
   }
-  if (files_.writeFileAtomically(device_paths::kLastSynced, snapshot->span(), &error)) {
-    return nullptr;
-  }
+  const bool isSealed =
+      expected ? expected->seal->putInPlace(&error)
+               : files_.writeDataAtomically(device_paths::kLastSynced, snapshot, &error);
+  if (isSealed) return nullptr;
   const ErrorPtr failure =
       systemError("cannot write", device_paths::kLastSynced, errnoOf(false, error));
   store.health().noteFailure("the sync is not sealed", failure);

@@ -215,28 +215,36 @@ void StoredAsset::addFace(const Rect& relativeRect, std::uint16_t identifier,
 }
 
 void StoredAsset::readAlbums() {
-  albums_.clear();
+  std::vector<KXGenericAlbumPtr> found;
   {
     SqliteStatement row(context_->store().database(),
                         "SELECT album FROM memberships WHERE asset = ? ORDER BY album");
     row.integer(pk_);
-    while (row.step()) albums_.push_back(context_->album(row.integerAt(0)));
+    while (row.step()) found.push_back(context_->album(row.integerAt(0)));
   }
   for (const auto& [album, member] : context_->unsavedMemberships(pk_)) {
-    const auto place = placeOf(albums_, album);
-    const bool present = place != albums_.end() && rowOf(*place) == album;
-    if (member && !present) albums_.insert(place, context_->album(album));
-    if (!member && present) albums_.erase(place);
+    const auto place = placeOf(found, album);
+    const bool present = place != found.end() && rowOf(*place) == album;
+    if (member && !present) found.insert(place, context_->album(album));
+    if (!member && present) found.erase(place);
   }
-  std::erase_if(albums_, [](const KXGenericAlbumPtr& album) { return album->isDeleted(); });
+  std::erase_if(found, [](const KXGenericAlbumPtr& album) { return album->isDeleted(); });
+  setAlbums(found);
   albumsRead_ = true;
   albumsEpoch_ = context_->albumsEpoch();
+}
+
+void StoredAsset::setAlbums(std::span<const KXGenericAlbumPtr> albums) {
+  const auto own = std::make_shared<KXGenericAlbumPtr[]>(albums.size());
+  std::copy(albums.begin(), albums.end(), own.get());
+  albums_ = own;
+  albumCount_ = static_cast<std::uint32_t>(albums.size());
 }
 
 std::span<const KXGenericAlbumPtr> StoredAsset::albums() {
   if (context_ == nullptr || life_ == Life::kGone) return {};
   if (!albumsRead_ || albumsEpoch_ != context_->albumsEpoch()) readAlbums();
-  return albums_;
+  return {albums_.get(), albumCount_};
 }
 
 bool StoredAsset::isIn(const StoredAlbum& album) {
@@ -248,7 +256,9 @@ bool StoredAsset::isIn(const StoredAlbum& album) {
 void StoredAsset::join(StoredAlbum& album) {
   if (!live() || isIn(album)) return;
   context_->setMembership(album.rowId(), pk_, true);
-  albums_.insert(placeOf(albums_, album.rowId()), album.shared_from_this());
+  std::vector<KXGenericAlbumPtr> now(albums_.get(), albums_.get() + albumCount_);
+  now.insert(placeOf(now, album.rowId()), album.shared_from_this());
+  setAlbums(now);
   relationsChanged_ = true;
   context_->noteChanged(*this);
 }
@@ -256,7 +266,9 @@ void StoredAsset::join(StoredAlbum& album) {
 void StoredAsset::leave(StoredAlbum& album) {
   if (!live() || !isIn(album)) return;
   context_->setMembership(album.rowId(), pk_, false);
-  albums_.erase(placeOf(albums_, album.rowId()));
+  std::vector<KXGenericAlbumPtr> now(albums_.get(), albums_.get() + albumCount_);
+  now.erase(placeOf(now, album.rowId()));
+  setAlbums(now);
   relationsChanged_ = true;
   context_->noteChanged(*this);
 }
@@ -282,7 +294,8 @@ void StoredAsset::forgetRelations() {
   facesRead_ = false;
   albumsRead_ = false;
   faces_ = {};
-  albums_ = {};
+  albums_ = nullptr;
+  albumCount_ = 0;
 }
 
 void StoredAsset::fault() {

@@ -95,6 +95,7 @@ class StoredAsset : public KXManagedAsset, public std::enable_shared_from_this<S
   }
   void load(AssetRow row) const;
   void readAlbums();
+  void setAlbums(std::span<const KXGenericAlbumPtr> albums);
   bool isIn(const StoredAlbum& album);
   void forgetRelations();
   void fault();
@@ -113,7 +114,9 @@ class StoredAsset : public KXManagedAsset, public std::enable_shared_from_this<S
   mutable AssetRow row_;
   std::unique_ptr<DeviceAssetFields> edits_;
   std::vector<KXManagedFacePtr> faces_;
-  std::vector<KXGenericAlbumPtr> albums_;
+  // In row order; with those of others in one piece of memory when they were read together.
+  std::shared_ptr<const KXGenericAlbumPtr[]> albums_;
+  std::uint32_t albumCount_ = 0;
 };
 
 }  // namespace kx

@@ -7,10 +7,10 @@
 #include <string_view>
 #include <vector>
 
+#include "platform/foundation/RecordBlocks.h"
 #include "records/KXSAssetProperties.h"
 #include "records/KXSFace.h"
 #include "records/KXSItem.h"
-#include "records/RecordBlocks.h"
 
 namespace kx {
 

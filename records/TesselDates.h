@@ -1,6 +1,9 @@
 #pragma once
 
+#include <optional>
+
 #include "platform/foundation/Date.h"
+#include "platform/foundation/Value.h"
 
 namespace kx {
 
@@ -11,6 +14,10 @@ inline constexpr double kTesselEpochOffsetSeconds = 3061152000.0;
 // zone and no leap second enters.
 inline Date dateWithTesselTimeInterval(double secondsSince1904) {
   return Date{secondsSince1904 - kTesselEpochOffsetSeconds};
+}
+// The same of a record's number; null counts as 0.0.
+inline Date dateWithTesselTimeInterval(const std::optional<Number>& secondsSince1904) {
+  return dateWithTesselTimeInterval(secondsSince1904 ? secondsSince1904->doubleValue() : 0.0);
 }
 
 }  // namespace kx

@@ -7,6 +7,7 @@
 #include <span>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 #include "platform/foundation/Data.h"
@@ -53,6 +54,25 @@ class FileSystem {
   // synced. A file that already holds exactly these bytes is left as it is.
   virtual bool writeFileAtomically(const std::string& path, std::span<const std::uint8_t> bytes,
                                    ErrorPtr* error) = 0;
+  // The same with a data object. An implementation may answer reads with it as long as the file is
+  // as it was written.
+  virtual bool writeDataAtomically(const std::string& path, const DataPtr& bytes, ErrorPtr* error) {
+    return writeFileAtomically(path, bytes->span(), error);
+  }
+
+  // Bytes that are about to become a file. Without putInPlace nothing of them stays. One thread at
+  // a time; the file system outlives it.
+  class PreparedFile {
+   public:
+    virtual ~PreparedFile() = default;
+    // As writeFileAtomically. Once.
+    virtual bool putInPlace(ErrorPtr* error) = 0;
+  };
+  // Does what can be done of writeDataAtomically before the file is to change. What fails is left
+  // to putInPlace.
+  virtual std::unique_ptr<PreparedFile> prepareFile(const std::string& path, DataPtr bytes) {
+    return std::make_unique<UnpreparedFile>(*this, path, std::move(bytes));
+  }
   // Removes a file or an empty directory; a missing one is an error (ENOENT).
   virtual bool removeItem(const std::string& path, ErrorPtr* error) = 0;
   virtual bool createDirectoryWithIntermediates(const std::string& path, ErrorPtr* error) = 0;
@@ -82,6 +102,22 @@ class FileSystem {
   };
   // Opens the file read-only and tries to take an exclusive lock on it without waiting.
   virtual LockAttempt tryLock(const std::string& path) = 0;
+
+ protected:
+  // Leaves everything to putInPlace.
+  class UnpreparedFile : public PreparedFile {
+   public:
+    UnpreparedFile(FileSystem& files, std::string path, DataPtr bytes)
+        : files_(files), path_(std::move(path)), bytes_(std::move(bytes)) {}
+    bool putInPlace(ErrorPtr* error) override {
+      return files_.writeDataAtomically(path_, bytes_, error);
+    }
+
+   private:
+    FileSystem& files_;
+    const std::string path_;
+    const DataPtr bytes_;
+  };
 };
 
 }  // namespace kx

@@ -1,3 +1,4 @@
+#include <algorithm>
 #include <cstring>
 
 #include "platform/foundation/Exceptions.h"
@@ -15,26 +16,38 @@ void requireIndex(std::size_t index, std::size_t size) {
 
 }  // namespace
 
-std::size_t DictionaryContent::indexOf(std::string_view key) const {
-  if (slots_.empty()) {
-    for (std::size_t i = 0; i < entries_.size(); ++i) {
-      if (ValueAccess::text(entries_[i].key) == key) return i;
-    }
-    return kNone;
-  }
-  const std::size_t mask = slots_.size() - 1;
-  for (std::size_t slot = hashText(key) & mask; slots_[slot] != 0; slot = (slot + 1) & mask) {
-    const std::size_t index = slots_[slot] - 1;
-    if (ValueAccess::text(entries_[index].key) == key) return index;
+std::size_t DictionaryContent::scan(std::string_view key) const {
+  for (std::size_t i = 0; i < entries_.size(); ++i) {
+    if (ValueAccess::text(entries_[i].key) == key) return i;
   }
   return kNone;
 }
 
+std::size_t DictionaryContent::probe(std::string_view key) const {
+  const std::size_t mask = slots_.size() - 1;
+  std::size_t slot = hashText(key) & mask;
+  while (slots_[slot] != 0 && ValueAccess::text(entries_[slots_[slot] - 1].key) != key) {
+    slot = (slot + 1) & mask;
+  }
+  return slot;
+}
+
+std::size_t DictionaryContent::indexOf(std::string_view key) const {
+  if (slots_.empty()) return scan(key);
+  const std::uint32_t found = slots_[probe(key)];
+  return found == 0 ? kNone : found - 1;
+}
+
+void DictionaryContent::reserve(std::size_t count) {
+  entries_.reserve(count);
+  if (count > kScanLimit) rebuildIndex(std::max(count, entries_.size()));
+}
+
 void DictionaryContent::append(Value key, Value value) {
   entries_.push_back(Entry{std::move(key), std::move(value)});
-  if (entries_.size() <= kScanLimit) return;
+  if (slots_.empty() && entries_.size() <= kScanLimit) return;
   if (entries_.size() * 2 > slots_.size()) {
-    rebuildIndex();
+    rebuildIndex(entries_.size());
   } else {
     link(entries_.size() - 1);
   }
@@ -42,19 +55,16 @@ void DictionaryContent::append(Value key, Value value) {
 
 void DictionaryContent::removeAt(std::size_t index) {
   entries_.erase(entries_.begin() + static_cast<std::ptrdiff_t>(index));
-  if (!slots_.empty()) rebuildIndex();
+  if (!slots_.empty()) rebuildIndex(entries_.size());
 }
 
 void DictionaryContent::link(std::size_t index) {
-  const std::size_t mask = slots_.size() - 1;
-  std::size_t slot = hashText(ValueAccess::text(entries_[index].key)) & mask;
-  while (slots_[slot] != 0) slot = (slot + 1) & mask;
-  slots_[slot] = static_cast<std::uint32_t>(index + 1);
+  slots_[probe(ValueAccess::text(entries_[index].key))] = static_cast<std::uint32_t>(index + 1);
 }
 
-void DictionaryContent::rebuildIndex() {
+void DictionaryContent::rebuildIndex(std::size_t count) {
   std::size_t capacity = 32;
-  while (capacity < entries_.size() * 3) capacity *= 2;
+  while (capacity < count * 3) capacity *= 2;
   slots_.assign(capacity, 0);
   for (std::size_t i = 0; i < entries_.size(); ++i) link(i);
 }
@@ -131,16 +141,17 @@ Dictionary& Dictionary::operator=(Dictionary other) noexcept {
 }
 Dictionary::~Dictionary() = default;
 
+void Dictionary::reserve(std::size_t count) {
+  if (content_ == nullptr) content_ = std::make_unique<DictionaryContent>();
+  content_->reserve(count);
+}
+
 void Dictionary::set(std::string_view key, Value value) {
   if (value.isNull()) {
     throw InternalInconsistency("null stored under \"" + std::string(key) + "\"");
   }
   if (content_ == nullptr) content_ = std::make_unique<DictionaryContent>();
-  if (const std::size_t index = content_->indexOf(key); index != DictionaryContent::kNone) {
-    content_->replace(index, std::move(value));
-  } else {
-    content_->append(Value::string(key), std::move(value));
-  }
+  content_->set(key, std::move(value), [&] { return Value::string(key); });
 }
 
 void Dictionary::set(const Value& key, Value value) {
@@ -149,11 +160,7 @@ void Dictionary::set(const Value& key, Value value) {
     throw InternalInconsistency("null stored under \"" + std::string(text) + "\"");
   }
   if (content_ == nullptr) content_ = std::make_unique<DictionaryContent>();
-  if (const std::size_t index = content_->indexOf(text); index != DictionaryContent::kNone) {
-    content_->replace(index, std::move(value));
-  } else {
-    content_->append(key, std::move(value));
-  }
+  content_->set(text, std::move(value), [&] { return key; });
 }
 
 void Dictionary::setIfPresent(std::string_view key, Value value) {

@@ -272,6 +272,8 @@ class Dictionary {
   Dictionary& operator=(Dictionary other) noexcept;
   ~Dictionary();
 
+  // Before very many entries are set.
+  void reserve(std::size_t count);
   void set(std::string_view key, Value value);
   void set(const Value& key, Value value);  // key is a string value; shares its text
   // Sets only a value that is not null.

@@ -49,17 +49,34 @@ class DictionaryContent {
     const std::size_t index = indexOf(key);
     return index == kNone ? nullptr : &entries_[index].value;
   }
-  void reserve(std::size_t count) { entries_.reserve(count); }
+  void reserve(std::size_t count);
   // The key is known to be absent.
   void append(Value key, Value value);
-  void replace(std::size_t index, Value value) { entries_[index].value = std::move(value); }
+  // Appends or replaces; the key is made when it is absent.
+  template <typename MakeKey>
+  void set(std::string_view key, Value value, const MakeKey& makeKey) {
+    const std::size_t slot = slots_.empty() ? kNone : probe(key);
+    const std::size_t index = slot == kNone ? scan(key) : std::size_t{slots_[slot]} - 1;
+    if (index != kNone) {
+      entries_[index].value = std::move(value);
+    } else if (slot != kNone && (entries_.size() + 1) * 2 <= slots_.size()) {
+      entries_.push_back(Entry{makeKey(), std::move(value)});
+      slots_[slot] = static_cast<std::uint32_t>(entries_.size());
+    } else {
+      append(makeKey(), std::move(value));
+    }
+  }
   void removeAt(std::size_t index);
 
  private:
   friend class ValueStorage;
   static constexpr std::size_t kScanLimit = 12;
+  std::size_t scan(std::string_view key) const;
+  // The slot of the key, or the free one where it would go.
+  std::size_t probe(std::string_view key) const;
   void link(std::size_t index);
-  void rebuildIndex();
+  // For that many entries.
+  void rebuildIndex(std::size_t count);
 
   std::vector<Entry> entries_;
   std::vector<std::uint32_t> slots_;  // entry index plus 1, 0 is free; empty for small contents

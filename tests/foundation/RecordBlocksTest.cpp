@@ -1,4 +1,4 @@
-#include "records/RecordBlocks.h"
+#include "platform/foundation/RecordBlocks.h"
 
 #include <gtest/gtest.h>
 
