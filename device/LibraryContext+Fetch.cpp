@@ -105,6 +105,7 @@ void LibraryContext::readAhead(const std::atomic<bool>& wanted) {
   wanted_ = &wanted;
   try {
     Ahead ahead;
+    ahead.dataVersion = store_->dataVersion();
     readAssets({}, &ahead.assets);
     prefetchFaces(ahead.assets);
     prefetchAlbums(ahead.assets);
@@ -123,6 +124,14 @@ bool LibraryContext::isReadAhead(const AssetPredicate& predicate) const {
          changedFaces_.empty() && memberships_.empty() &&
          predicate.comparison == synced.comparison &&
          predicate.savedAssetType == synced.savedAssetType;
+}
+
+bool LibraryContext::showRowsReadAhead(const std::function<bool(const AssetRow&)>& visit) {
+  if (!isReadAhead({}) || ahead_->dataVersion != store_->dataVersion()) return false;
+  for (const KXManagedAssetPtr& asset : ahead_->assets) {
+    if (!visit(static_cast<const StoredAsset&>(*asset).saved())) break;
+  }
+  return true;
 }
 
 bool LibraryContext::nextRow(SqliteStatement& row) {

@@ -135,8 +135,8 @@ ErrorPtr LibraryContext::save() {
 }
 
 std::optional<LibraryWriter::AssetAtHand> LibraryContext::assetAtHand(RowId pk) const {
-  const std::shared_ptr<StoredAsset> known = assets_.find(pk);
-  if (!known || !known->loaded_ || known->isDeleted()) return std::nullopt;
+  const StoredAsset* const known = assets_.peek(pk);
+  if (known == nullptr || !known->loaded_ || known->isDeleted()) return std::nullopt;
   const OptionalString uuid = known->uuid();
   if (!uuid) return std::nullopt;
   return LibraryWriter::AssetAtHand{*uuid, known->sortToken()};

@@ -2,6 +2,7 @@
 
 #include <atomic>
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <memory>
 #include <optional>
@@ -48,6 +49,11 @@ class LibraryContext : public KXManagedObjectContext {
   // to the fetch itself.
   void readAhead(const std::atomic<bool>& wanted);
 
+  // Shows the row of every synced asset, as long as the visitor wants more of them, if all were
+  // read ahead and neither this program nor another has changed the library's assets since.
+  // Otherwise false, and none is shown.
+  bool showRowsReadAhead(const std::function<bool(const AssetRow&)>& visit);
+
   // What KXPhotoLibrary's class operations need.
   KXGenericAlbumPtr albumWithRole(std::string_view role);
   KXGenericAlbumPtr insertAlbum(std::int32_t kind, ListId list);
@@ -93,7 +99,8 @@ class LibraryContext : public KXManagedObjectContext {
   // The synced assets, their faces and albums, as they were read ahead.
   struct Ahead {
     std::vector<KXManagedAssetPtr> assets;
-    std::uint64_t changes = 0;  // the store's assetChanges then
+    std::uint64_t changes = 0;     // the store's assetChanges then
+    std::int64_t dataVersion = 0;  // the database's
     std::uint32_t albumsEpoch = 0;
   };
 

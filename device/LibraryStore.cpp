@@ -1,5 +1,6 @@
 #include "device/LibraryStore.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <charconv>
 
@@ -76,6 +77,16 @@ ErrorPtr LibraryStore::write(const Work& work, const LibraryContext* origin) {
   }
   health().noteFailure("a library transaction was rolled back", failure);
   return failure;
+}
+
+std::int64_t LibraryStore::dataVersion() {
+  SqliteStatement row(database(), "PRAGMA data_version");
+  return row.step() ? row.integerAt(0) : 0;
+}
+
+bool LibraryStore::showRowsReadAhead(const std::function<bool(const AssetRow&)>& visit) {
+  return std::any_of(contexts_.begin(), contexts_.end(),
+                     [&](LibraryContext* context) { return context->showRowsReadAhead(visit); });
 }
 
 void LibraryStore::published(LibraryWriter& writer, const LibraryContext* origin) {

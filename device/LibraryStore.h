@@ -60,6 +60,11 @@ class LibraryStore {
   // Grows with every transaction that has changed assets, their faces or memberships.
   std::uint64_t assetChanges() const { return assetChanges_; }
 
+  // Another number as soon as another program has changed the database.
+  std::int64_t dataVersion();
+  // As LibraryContext, of the first context that can.
+  bool showRowsReadAhead(const std::function<bool(const AssetRow&)>& visit);
+
   // Called, on the queue, after every commit.
   void setOnCommit(std::function<void()> onCommit) { onCommit_ = std::move(onCommit); }
 

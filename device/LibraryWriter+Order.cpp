@@ -81,9 +81,11 @@ std::vector<Member> LibraryWriter::membersOf(RowId album, const AssetOrder::Albu
   row.integer(album);
   while (row.step()) {
     Member member{row.integerAt(0), std::nullopt, row.optionalIntegerAt(1)};
-    withAsset(member.asset, [&](std::string_view uuid, const std::optional<double>&) {
-      member.index = order.indexOf(uuid);
-    });
+    if (order.tag() != 0) {
+      withAsset(member.asset, [&](std::string_view uuid, const std::optional<double>&) {
+        member.index = order.indexOf(uuid);
+      });
+    }
     members.push_back(member);
   }
   return members;

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cstddef>
 #include <iterator>
+#include <utility>
 
 namespace kx {
 namespace {
@@ -45,6 +46,10 @@ std::vector<Group> groupsOf(std::vector<Member>& members) {
   return groups;
 }
 
+bool isBefore(const std::pair<std::int64_t, std::int64_t>& place, std::int64_t index) {
+  return place.first < index;
+}
+
 // The most groups whose positions ascend already.
 std::vector<Group> longestAscent(const std::vector<Group>& groups) {
   constexpr std::size_t kNone = static_cast<std::size_t>(-1);
@@ -73,13 +78,31 @@ std::vector<Group> longestAscent(const std::vector<Group>& groups) {
 
 }  // namespace
 
+const MemberPositions::Place* MemberPositions::before(std::int64_t index) const {
+  const auto learned = std::lower_bound(learned_.begin(), learned_.end(), index, isBefore);
+  const auto later = later_.lower_bound(index);
+  const Place* const a = learned == learned_.begin() ? nullptr : &*std::prev(learned);
+  const Place* const b = later == later_.begin() ? nullptr : &std::prev(later)->second;
+  return a == nullptr || (b != nullptr && a->first < b->first) ? b : a;
+}
+
+const MemberPositions::Place* MemberPositions::notBefore(std::int64_t index) const {
+  const auto learned = std::lower_bound(learned_.begin(), learned_.end(), index, isBefore);
+  const auto later = later_.lower_bound(index);
+  const Place* const a = learned == learned_.end() ? nullptr : &*learned;
+  const Place* const b = later == later_.end() ? nullptr : &later->second;
+  return a == nullptr || (b != nullptr && b->first < a->first) ? b : a;
+}
+
 std::vector<Move> MemberPositions::adopt(std::vector<Member> members) {
   const std::vector<Group> groups = groupsOf(members);
-  positions_.clear();
+  learned_.clear();
+  later_.clear();
+  learned_.reserve(groups.size());
   for (const Group& group : longestAscent(groups)) {
-    positions_.emplace_hint(positions_.end(), group.index, *group.stored);
+    learned_.emplace_back(group.index, *group.stored);
   }
-  if (positions_.size() < groups.size()) {
+  if (learned_.size() < groups.size()) {
     for (const Group& group : groups) {
       if (!place(group.index)) return numberAnew(members, std::nullopt);
     }
@@ -88,13 +111,14 @@ std::vector<Move> MemberPositions::adopt(std::vector<Member> members) {
 }
 
 std::optional<std::int64_t> MemberPositions::place(std::int64_t index) {
-  const auto next = positions_.lower_bound(index);
-  if (next != positions_.end() && next->first == index) return next->second;
+  const Place* const next = notBefore(index);
+  if (next != nullptr && next->first == index) return next->second;
+  const Place* const last = before(index);
   std::int64_t position = 0;
-  if (positions_.empty()) {
+  if (next == nullptr && last == nullptr) {
     position = canBeSpaced(index) ? index * kGap : index;
-  } else if (next == positions_.end() || next == positions_.begin()) {
-    const auto& [nearIndex, near] = next == positions_.end() ? *positions_.rbegin() : *next;
+  } else if (next == nullptr || last == nullptr) {
+    const auto& [nearIndex, near] = next == nullptr ? *last : *next;
     std::int64_t distance = 0;
     if (__builtin_sub_overflow(index, nearIndex, &distance) ||
         __builtin_mul_overflow(distance, kGap, &distance) ||
@@ -102,7 +126,7 @@ std::optional<std::int64_t> MemberPositions::place(std::int64_t index) {
       return std::nullopt;
     }
   } else {
-    const auto& [lowIndex, low] = *std::prev(next);
+    const auto& [lowIndex, low] = *last;
     const auto distance = [](std::int64_t from, std::int64_t to) {
       return static_cast<std::uint64_t>(to) - static_cast<std::uint64_t>(from);
     };
@@ -112,7 +136,7 @@ std::optional<std::int64_t> MemberPositions::place(std::int64_t index) {
     position = static_cast<std::int64_t>(static_cast<std::uint64_t>(low) +
                                          step * distance(lowIndex, index));
   }
-  positions_.emplace_hint(next, index, position);
+  later_.emplace(index, Place(index, position));
   return position;
 }
 
@@ -122,31 +146,31 @@ std::vector<Move> MemberPositions::numberAnew(const std::vector<Member>& members
                       std::all_of(members.begin(), members.end(), [](const Member& member) {
                         return !member.index || canBeSpaced(*member.index);
                       });
+  learned_.clear();
+  later_.clear();
   const auto number = [&](std::int64_t index) {
-    positions_.emplace(index, spaced ? index * kGap : index);
+    learned_.emplace_back(index, spaced ? index * kGap : index);
   };
-  positions_.clear();
   if (joining) number(*joining);
   for (const Member& member : members) {
     if (member.index) number(*member.index);
   }
+  std::sort(learned_.begin(), learned_.end());
+  learned_.erase(std::unique(learned_.begin(), learned_.end()), learned_.end());
   return movesOf(members);
 }
 
 std::vector<Move> MemberPositions::movesOf(const std::vector<Member>& members) const {
   std::vector<Move> moves;
-  auto known = positions_.begin();
+  auto next = learned_.begin();
   for (const Member& member : members) {
     std::optional<std::int64_t> position;
     if (member.index) {
+      const auto isNext = [&] { return next != learned_.end() && next->first == *member.index; };
       // Mostly one after the other.
-      if (known == positions_.end() || known->first != *member.index) {
-        if (known != positions_.end()) ++known;
-        if (known == positions_.end() || known->first != *member.index) {
-          known = positions_.find(*member.index);
-        }
-      }
-      position = known->second;
+      if (!isNext())
+        next = std::lower_bound(learned_.begin(), learned_.end(), *member.index, isBefore);
+      position = isNext() ? (next++)->second : later_.at(*member.index).second;
     }
     if (position != member.stored) moves.push_back({member.asset, position});
   }

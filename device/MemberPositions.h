@@ -39,9 +39,16 @@ class MemberPositions {
                                std::optional<std::int64_t> joining);
 
  private:
-  std::vector<Move> movesOf(const std::vector<Member>& members) const;
+  using Place = std::pair<std::int64_t, std::int64_t>;  // index, position
 
-  std::map<std::int64_t, std::int64_t> positions_;  // by index
+  std::vector<Move> movesOf(const std::vector<Member>& members) const;
+  // The nearest below the index, and the nearest that is not; null when there is none.
+  const Place* before(std::int64_t index) const;
+  const Place* notBefore(std::int64_t index) const;
+
+  // What was learned at once, and what has come since, mostly little.
+  std::vector<Place> learned_;           // by index, ascending
+  std::map<std::int64_t, Place> later_;  // by index
 };
 
 // What is known of albums' positions under the order that the file gave them. Whoever rolls back

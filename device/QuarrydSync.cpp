@@ -93,25 +93,32 @@ std::optional<std::string> Quarryd::whyNotWhole(const DataPtr& snapshot, Expecte
 std::optional<std::string> Quarryd::whyNotInLibrary(SnapshotAssets wanted) {
   LibraryStore& store = *parts_.store;
   std::optional<std::string> found;
+  // False when the asset is not as it should be.
+  const auto prove = [&](std::string_view uuid, std::optional<double> modified, bool isIncomplete) {
+    SnapshotAssets::Asset* const expected = wanted.find(uuid);
+    if (expected == nullptr) return true;
+    if (isIncomplete) {
+      found = std::string(uuid) + " is incomplete";
+    } else if (modified != std::optional<double>(expected->modified)) {
+      found = std::string(uuid) + " has another modification date";
+    } else {
+      expected->proved = true;
+    }
+    return !found;
+  };
   store.queue().sync([&] {
     try {
-      SqliteStatement row(store.database(),
-                          "SELECT uuid, modification_date, incomplete FROM assets "
-                          "WHERE +saved_type = 256");
-      while (row.step()) {
-        const std::string_view uuid = row.textViewAt(0);
-        SnapshotAssets::Asset* const expected = wanted.find(uuid);
-        if (expected == nullptr) continue;
-        if (row.integerAt(2) != 0) {
-          found = std::string(uuid) + " is incomplete";
-          return;
-        }
-        if (row.optionalRealAt(1) != std::optional<double>(expected->modified)) {
-          found = std::string(uuid) + " has another modification date";
-          return;
-        }
-        expected->proved = true;
+      const bool isRead = store.showRowsReadAhead([&](const AssetRow& row) {
+        return prove(row.uuid, row.modificationDate, row.incomplete);
+      });
+      if (!isRead) {
+        SqliteStatement row(store.database(),
+                            "SELECT uuid, modification_date, incomplete FROM assets "
+                            "WHERE +saved_type = 256");
+        while (row.step() && prove(row.textViewAt(0), row.optionalRealAt(1), row.integerAt(2) != 0))
+          continue;
       }
+      if (found) return;
       if (const OptionalString missing = wanted.firstNotProved()) {
         found = std::string(*missing) + " is not in the library";
       }

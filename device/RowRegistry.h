@@ -32,6 +32,13 @@ class RowRegistry {
     const auto known = sparse_.find(pk);
     return known == sparse_.end() ? nullptr : known->second;
   }
+  // The same without a share in it.
+  T* peek(RowId pk) const {
+    const auto row = static_cast<std::size_t>(pk);
+    if (row < dense_.size()) return dense_[row].get();
+    const auto known = sparse_.find(pk);
+    return known == sparse_.end() ? nullptr : known->second.get();
+  }
   void erase(RowId pk) {
     const auto row = static_cast<std::size_t>(pk);
     if (row < dense_.size()) {

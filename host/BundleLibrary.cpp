@@ -76,10 +76,11 @@ class BundleLibrary final : public HostLibrary {
       throw std::system_error(names().failure, std::generic_category(), kBundleMediaName);
     }
     std::vector<MediaName> result;
-    for (const std::string& name : names().sorted) {
+    for (const std::size_t start : names().starts) {
+      const std::string_view name = names().at(start);
       if (name.front() == '.') continue;
-      std::string uuid = name.substr(0, name.find('.'));
-      if (nameOf(uuid) == name) result.push_back({std::move(uuid), name});
+      std::string uuid(name.substr(0, name.find('.')));
+      if (nameOf(uuid) == name) result.push_back({std::move(uuid), std::string(name)});
     }
     return result;
   }
@@ -91,26 +92,42 @@ class BundleLibrary final : public HostLibrary {
     return false;
   }
 
+  // Very many names, in one text.
   struct Names {
-    std::vector<std::string> sorted;  // by bytes
+    std::string text;                 // each with its NUL
+    std::vector<std::size_t> starts;  // in the text, the names sorted by bytes
     int failure = 0;                  // errno when they could not be listed
+
+    std::string_view at(std::size_t start) const { return text.c_str() + start; }
   };
 
   // The names in media/, listed when first asked for: a sync without new files never does.
   const Names& names() const {
-    std::call_once(listed_, [this] { names_.failure = listNames(media_.get(), &names_.sorted); });
+    std::call_once(listed_, [this] {
+      names_.failure = forEachName(media_.get(), [this](std::string_view name) {
+        names_.starts.push_back(names_.text.size());
+        names_.text.append(name).push_back('\0');
+      });
+      std::sort(names_.starts.begin(), names_.starts.end(),
+                [this](std::size_t a, std::size_t b) { return names_.at(a) < names_.at(b); });
+    });
     return names_;
   }
 
   // The name of the asset's file in media/, "" when there is none.
   std::string nameOf(std::string_view uuid) const {
     if (!isOneComponent(uuid)) return {};
-    const std::vector<std::string>& sorted = names().sorted;
-    const std::string exact(uuid);
-    if (std::binary_search(sorted.begin(), sorted.end(), exact)) return exact;
-    const std::string prefix = exact + ".";
-    const auto found = std::lower_bound(sorted.begin(), sorted.end(), prefix);
-    return found != sorted.end() && found->starts_with(prefix) ? *found : std::string();
+    const Names& names = this->names();
+    const auto atLeast = [&names](std::string_view wanted) -> std::string_view {
+      const auto found = std::lower_bound(
+          names.starts.begin(), names.starts.end(), wanted,
+          [&names](std::size_t start, std::string_view name) { return names.at(start) < name; });
+      return found == names.starts.end() ? std::string_view() : names.at(*found);
+    };
+    if (atLeast(uuid) == uuid) return std::string(uuid);
+    const std::string prefix = std::string(uuid) + ".";
+    const std::string_view next = atLeast(prefix);
+    return next.starts_with(prefix) ? std::string(next) : std::string();
   }
 
   std::string rootText(std::string_view key) const {

@@ -111,24 +111,29 @@ int openRegularPath(const std::string& path, FileHandle* file, struct stat* stat
   return error != 0 ? asRegularError(error) : takeRegular(std::move(opened), file, status);
 }
 
-int listNames(int folder, std::vector<std::string>* names) {
+int forEachName(int folder, const std::function<void(std::string_view)>& visit) {
   FileHandle own;
   const int error = openAt(folder, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC, &own);
   if (error != 0) return error;
   const std::unique_ptr<DIR, int (*)(DIR*)> stream(::fdopendir(own.get()), &::closedir);
   if (stream == nullptr) return errno;
   (void)own.release();  // the stream closes it
-  names->clear();
   while (true) {
     errno = 0;
     const dirent* entry = ::readdir(stream.get());
     if (entry == nullptr) break;
     const std::string_view name = entry->d_name;
-    if (name != "." && name != "..") names->emplace_back(name);
+    if (name != "." && name != "..") visit(name);
   }
-  if (errno != 0) return errno;
+  return errno;
+}
+
+int listNames(int folder, std::vector<std::string>* names) {
+  names->clear();
+  const int error =
+      forEachName(folder, [names](std::string_view name) { names->emplace_back(name); });
   std::sort(names->begin(), names->end());
-  return 0;
+  return error;
 }
 
 int readWhole(int file, std::uint64_t limitBytes, std::vector<std::uint8_t>* bytes) {

@@ -3,6 +3,7 @@
 #include <sys/stat.h>
 
 #include <cstdint>
+#include <functional>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -37,7 +38,9 @@ int openRegularPath(const std::string& path, FileHandle* file, struct stat* stat
 std::optional<HostMedia> openHostMedia(int folder, const std::string& relativePath,
                                        ErrorPtr* error);
 
-// All names in the directory but "." and "..", sorted by bytes.
+// All names in the directory but "." and "..", in no order.
+int forEachName(int folder, const std::function<void(std::string_view)>& visit);
+// The same sorted by bytes.
 int listNames(int folder, std::vector<std::string>* names);
 
 // Reads the whole file; EFBIG when it is longer than the limit, EIO when it shrinks meanwhile.
