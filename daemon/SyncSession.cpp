@@ -9,6 +9,7 @@
 #include "daemon/PlannedTransfers.h"
 #include "daemon/RunErrors.h"
 #include "daemon/TransferLoop.h"
+#include "platform/foundation/PropertyList.h"
 
 namespace kx {
 namespace {
@@ -39,9 +40,9 @@ bool isSealed(const std::string& deviceRoot) {
   return ::lstat((deviceRoot + KXPreviousMetadataSyncFilePath).c_str(), &status) == 0;
 }
 
-// Null when the file is missing, malformed or names none.
-std::optional<std::string> libraryUUIDIn(FileSystem& files, const std::string& path) {
-  const Value uuid = readDevicePropertyList(files, path)["libraryUUID"];
+// Null when there are no bytes, or they make no sense or name none.
+std::optional<std::string> libraryUUIDIn(const DataPtr& bytes) {
+  const Value uuid = bytes ? readPropertyList(bytes, nullptr)["libraryUUID"] : Value();
   if (!uuid.isString()) return std::nullopt;
   return std::string(uuid.stringValue());
 }
@@ -130,8 +131,8 @@ bool SyncSession::matchesSeal() {
 // What a sync that is no null one needs later on.
 void SyncSession::readMeanwhile() {
   context_.host.expectFiles();
-  sealedLibraryUUID_ = std::async(
-      std::launch::async, [this] { return libraryUUIDIn(files_, KXPreviousMetadataSyncFilePath); });
+  sealed_ = std::async(std::launch::async,
+                       [this] { return files_.readFile(KXPreviousMetadataSyncFilePath, nullptr); });
 }
 
 bool SyncSession::checkBeforeFirstEffect() {
@@ -199,7 +200,10 @@ bool SyncSession::callPrepare() {
 
 bool SyncSession::reconcile() {
   enter(SyncPhase::kReconciling);
-  const bool isResync = predictResync();
+  LibraryNames names;
+  if (!matchesSeal()) {
+    names = {sealed_.get(), files_.readFile(kKXCurrentLibraryUUIDPath, nullptr)};
+  }
   const bool hadLastSynced = files_.fileExists(KXPreviousMetadataSyncFilePath);
   // What is sealed belongs to the library that the device knows already.
   const ErrorPtr kept = matchesSeal() ? nullptr : librarySwitch_.begin(libraryUUID_);
@@ -218,7 +222,7 @@ bool SyncSession::reconcile() {
     endWithoutTransfers();
     return false;
   }
-  result_.resync = isResync;
+  if (!matchesSeal()) isResync_ = std::async(std::launch::async, &isOther, names, libraryUUID_);
   // Every reconcile but a null one takes the last-synced snapshot away.
   isNull_ = hadLastSynced && files_.fileExists(KXPreviousMetadataSyncFilePath);
   return true;
@@ -240,12 +244,12 @@ void SyncSession::settleLibrarySwitch(bool reconciled) {
   if (error) context_.device.health().noteFailure("current library file", error);
 }
 
-// By the rules of the reconcile, over the same files, before it changes them.
-bool SyncSession::predictResync() {
-  if (matchesSeal()) return false;
-  std::optional<std::string> known = sealedLibraryUUID_.get();
-  if (!known) known = libraryUUIDIn(files_, kKXCurrentLibraryUUIDPath);
-  return known != libraryUUID_;
+// Whether the library is another than the device had: by the rules of the reconcile, over what the
+// files held before it.
+bool SyncSession::isOther(const LibraryNames& before, const std::string& libraryUUID) {
+  std::optional<std::string> known = libraryUUIDIn(before.sealed);
+  if (!known) known = libraryUUIDIn(before.current);
+  return known != libraryUUID;
 }
 
 void SyncSession::transferAndEnd() {
@@ -341,6 +345,7 @@ void SyncSession::endWithoutTransfers() {
 
 void SyncSession::conclude() {
   context_.device.stopReadingAhead();
+  if (isResync_.valid()) result_.resync = isResync_.get();
   if (plugin_) {
     if (const auto raised = plugin_->destroyClient()) {
       fail(syncError(SyncErrorCode::kPlugin,

@@ -42,6 +42,12 @@ class SyncSession {
   SyncResult run();
 
  private:
+  // Files that name the library that the device had.
+  struct LibraryNames {
+    DataPtr sealed;   // the snapshot of the last whole sync
+    DataPtr current;  // the plug-in's own
+  };
+
   // The phases; false ends the run with what `result_` says by then.
   bool checkBeforeFirstEffect();
   void readMeanwhile();
@@ -60,7 +66,7 @@ class SyncSession {
   void conclude();
   void collectChanges(const LibraryChanges& changes);
   void judge();
-  bool predictResync();
+  static bool isOther(const LibraryNames& before, const std::string& libraryUUID);
   bool matchesSeal();
   ErrorPtr checkAgainstDevice();
   void sayWhenTooSmall(const std::vector<FRAssetPtr>& outstanding);
@@ -71,7 +77,7 @@ class SyncSession {
   void failCall(SyncErrorCode code, const std::string& call, const ErrorPtr& error);
 
   Context context_;
-  HostSnapshot snapshot_;    // until it is in place
+  HostSnapshot snapshot_;    // until the plug-in has read it
   std::string libraryUUID_;  // of a snapshot that was not sealed
   std::optional<bool> matchesSeal_;
   FileSystem& files_;
@@ -81,7 +87,8 @@ class SyncSession {
   SyncResult result_;
   std::set<std::string> requested_;  // identifiers of the sync requests
   double startedAt_;
-  std::future<std::optional<std::string>> sealedLibraryUUID_;
+  std::future<DataPtr> sealed_;  // the bytes of the snapshot before, null when there is none
+  std::future<bool> isResync_;
   bool isNull_ = false;
   bool cancelled_ = false;
   bool diskFull_ = false;

@@ -123,6 +123,55 @@ TEST_P(FileSystemContract, HoldsExactlyTheBytesThatAreThere) {
   EXPECT_FALSE(holds("/d/old", ""));
 }
 
+TEST_P(FileSystemContract, WritesDataObjects) {
+  const auto put = [this](const std::string& path, const std::string& text) {
+    const auto data = std::make_shared<const Data>(text.data(), text.size());
+    ErrorPtr error;
+    return codeOf(files().writeDataAtomically(path, data, &error), error);
+  };
+  std::string large(2'000'003, 'x');
+  EXPECT_EQ(put("/d/large", large), 0);
+  const DataPtr first = files().readFile("/d/large", nullptr);
+  EXPECT_EQ(read("/d/large"), large);
+  large.back() = 'y';
+  EXPECT_EQ(put("/d/large", large), 0);
+  EXPECT_EQ(read("/d/large"), large);
+  large.front() = 'z';
+  EXPECT_EQ(write("/d/large", large), 0);
+  EXPECT_EQ(read("/d/large"), large);
+  EXPECT_EQ(first->bytes()[first->length() - 1], 'x');
+  EXPECT_EQ(remove("/d/large"), 0);
+  EXPECT_EQ(read("/d/large"), "error " + std::to_string(ENOENT));
+  EXPECT_EQ(put("/d/sub", "text"), EISDIR);
+  EXPECT_EQ(put("/none/file", "text"), ENOENT);
+}
+
+TEST_P(FileSystemContract, APreparedFileIsThereWhenItIsPutInPlace) {
+  const std::string text = "prepared";
+  const auto data = std::make_shared<const Data>(text.data(), text.size());
+  const auto put = [](FileSystem::PreparedFile& file) {
+    ErrorPtr error;
+    return codeOf(file.putInPlace(&error), error);
+  };
+  { const auto dropped = files().prepareFile("/d/old", data); }
+  EXPECT_EQ(read("/d/old"), "old text");
+  EXPECT_EQ(list("/d"), (Texts{"empty", "old", "sub"}));
+  {
+    const auto replacing = files().prepareFile("/d/old", data);
+    const auto fresh = files().prepareFile("/d/new", data);
+    EXPECT_EQ(read("/d/old"), "old text");
+    EXPECT_FALSE(files().fileExists("/d/new"));
+    EXPECT_EQ(put(*replacing), 0);
+    EXPECT_EQ(put(*fresh), 0);
+  }
+  EXPECT_EQ(read("/d/old"), text);
+  EXPECT_EQ(read("/d/new"), text);
+  EXPECT_EQ(list("/d"), (Texts{"empty", "new", "old", "sub"}));
+  EXPECT_EQ(put(*files().prepareFile("/none/file", data)), ENOENT);
+  EXPECT_EQ(put(*files().prepareFile("/d/sub", data)), EISDIR);
+  EXPECT_EQ(list("/d"), (Texts{"empty", "new", "old", "sub"}));
+}
+
 TEST_P(FileSystemContract, ReadsWhatIsThere) {
   EXPECT_EQ(read("/d/old"), "old text");
   EXPECT_EQ(read("/d/none"), "error " + std::to_string(ENOENT));

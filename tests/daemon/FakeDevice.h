@@ -39,7 +39,7 @@ class FakeDevice : public ReferenceDevice {
   void setRestoreFiles(std::optional<std::vector<QBFile>>) override {}
   void drain() override { memory.saver.drain(); }
   DeviceDump dump(bool, ErrorPtr*) override { return content; }
-  void readAhead() override {}
+  void readAhead() override { ++readsAhead; }
   void stopReadingAhead() override {}
   LibraryDifference difference(const LibraryChanges&, ErrorPtr*) override { return {}; }
 
@@ -47,6 +47,7 @@ class FakeDevice : public ReferenceDevice {
   Health noted;
   LibraryChanges changes;
   DeviceDump content;  // what dump gives
+  int readsAhead = 0;
 };
 
 }  // namespace kx::test

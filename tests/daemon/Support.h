@@ -47,7 +47,9 @@ class DirectoryLink : public HostLink {
   DataPtr snapshot(ErrorPtr* error) override;
   std::optional<std::int64_t> mediaSize(std::string_view identifier) override;
   FileDescriptor openMedia(std::string_view identifier, ErrorPtr* error) override;
+  void expectFiles() override { ++filesExpected; }
 
+  int filesExpected = 0;
   DataPtr snapshotBytes;
   std::map<std::string, int, std::less<>> failures;        // errno by identifier, for every opening
   std::map<std::string, int, std::less<>> failTimes;       // how many openings fail; absent: all

@@ -80,6 +80,26 @@ class SyncRunnerTest : public testing::Test {
   CancelToken cancel;
 };
 
+// What a sync will need of host and device is begun early, but not for one that may be null.
+TEST_F(SyncRunnerTest, WhatWillBeNeededIsBegunEarly) {
+  const auto begun = [this] {
+    run();
+    return std::pair(std::exchange(device.readsAhead, 0), std::exchange(link.filesExpected, 0));
+  };
+  const auto seal = [this] {
+    device.memory.memoryFiles.writeFileAtomically(KXPreviousMetadataSyncFilePath,
+                                                  link.snapshotBytes->span(), nullptr);
+  };
+  EXPECT_EQ(begun(), std::pair(1, 1));
+  seal();
+  EXPECT_EQ(begun(), std::pair(1, 0));
+  link.snapshotBytes = plistBytes(snapshotRoot(
+      {assetItem("A", {{"latitude", Value::real(1.0)}, {"longitude", Value::real(2.0)}})}));
+  EXPECT_EQ(begun(), std::pair(1, 1));
+  seal();
+  EXPECT_EQ(begun(), std::pair(0, 0));
+}
+
 TEST_F(SyncRunnerTest, MakesTheCallsOfAWholeSyncInOrderOffTheMainThread) {
   ask({"A", "B"});
   const SyncResult result = run();

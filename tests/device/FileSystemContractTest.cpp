@@ -82,6 +82,53 @@ INSTANTIATE_TEST_SUITE_P(Overlay, FileSystemContract,
                            return std::make_unique<OverlaidFiles>();
                          }));
 
+// Readers of a large file share one data object, as long as the file is as it was.
+TEST(DeviceFileSystemTest, AFileThatHasChangedIsReadAnew) {
+  TemporaryDirectory directory;
+  DeviceFileSystem files(DeviceRoot::open(directory.path(), false, nullptr), false);
+  const auto text = [&files] {
+    const DataPtr data = files.readFile("/f", nullptr);
+    return data ? std::string(data->bytes(), data->bytes() + data->length()) : "none";
+  };
+  const std::string a(2 << 20, 'a');
+  const std::string b(2 << 20, 'b');
+  auto data = std::make_shared<const Data>(a.data(), a.size());
+  ASSERT_TRUE(files.writeDataAtomically("/f", data, nullptr));
+  EXPECT_EQ(files.readFile("/f", nullptr), data);
+  // In place, by another program, of equal length.
+  std::ofstream(directory.path() + "/f", std::ios::in | std::ios::binary) << b;
+  const DataPtr second = files.readFile("/f", nullptr);
+  EXPECT_EQ(text(), b);
+  EXPECT_EQ(files.readFile("/f", nullptr), second);
+  // By another file.
+  std::ofstream(directory.path() + "/g", std::ios::binary) << a;
+  fs::rename(directory.path() + "/g", directory.path() + "/f");
+  EXPECT_EQ(text(), a);
+  // A file that held the bytes before counts as written.
+  ASSERT_TRUE(files.writeDataAtomically("/f", data, nullptr));
+  EXPECT_EQ(files.readFile("/f", nullptr), data);
+  fs::remove(directory.path() + "/f");
+  EXPECT_EQ(text(), "none");
+  // Nobody holds it any longer: it is not kept either.
+  ASSERT_TRUE(files.writeDataAtomically("/f", data, nullptr));
+  const std::weak_ptr<const Data> gone = data;
+  data = nullptr;
+  EXPECT_TRUE(gone.expired());
+  EXPECT_EQ(text(), a);
+}
+
+TEST(DeviceFileSystemTest, AReadOnlyOnePreparesNothing) {
+  TemporaryDirectory directory;
+  DeviceFileSystem files(DeviceRoot::open(directory.path(), false, nullptr), true);
+  const auto data = std::make_shared<const Data>("x", 1);
+  const auto prepared = files.prepareFile("/f", data);
+  EXPECT_TRUE(fs::is_empty(directory.path()));
+  ErrorPtr error;
+  EXPECT_FALSE(prepared->putInPlace(&error));
+  ASSERT_NE(error, nullptr);
+  EXPECT_EQ(error->code(), EROFS);
+}
+
 // Over a directory that is missing everything has to be made first.
 TEST(OverlayFileSystemTest, StandsOnADirectoryThatIsMissing) {
   TemporaryDirectory directory;

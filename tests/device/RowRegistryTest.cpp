@@ -27,8 +27,10 @@ TEST(RowRegistryTest, RowsMayHaveAnyNumber) {
                                    std::numeric_limits<RowId>::min()};
   for (const RowId number : numbers) {
     EXPECT_EQ(registry.find(number), nullptr);
+    EXPECT_EQ(registry.peek(number), nullptr);
     registry.at(number) = std::make_shared<std::pair<RowId, int>>(number, 1);
   }
+  for (const RowId number : numbers) EXPECT_EQ(registry.peek(number), registry.find(number).get());
   const Rows expected{{numbers[5], 1}, {-1, 1}, {0, 1}, {5, 1}, {2'000, 1}, {numbers[0], 1}};
   EXPECT_EQ(rowsOf(registry), expected);
   for (const RowId number : numbers) {

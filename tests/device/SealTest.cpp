@@ -1,3 +1,4 @@
+#include "device/Sqlite.h"
 #include "tests/device/DeviceFixture.h"
 
 namespace kx {
@@ -67,6 +68,47 @@ TEST_F(SealTest, AfterItIsGoneTheSnapshotInPlaceThenIsProved) {
   save({sealJob()});
   EXPECT_FALSE(sealed());
   EXPECT_NE(reason().find(kUUID1 + " is not in the library"), std::string::npos) << reason();
+}
+
+// Rows that were read ahead prove as much as the table, as long as it is as it was.
+TEST_F(SealTest, RowsThatWereReadAheadProve) {
+  save({importJob(kUUID1, kJpeg), importJob(kUUID2, kJpeg)});
+  device().readAhead();
+  device().drain();
+  read([&] { library().managedObjectContext().fetchAssets({}, nullptr); });
+  putSnapshot({kUUID1, kUUID2, kUUID3});
+  save({sealJob()});
+  EXPECT_NE(reason().find(kUUID3 + " is not in the library"), std::string::npos) << reason();
+  putSnapshot({kUUID1, kUUID2}, 7.0);
+  save({sealJob()});
+  EXPECT_NE(reason().find("another modification date"), std::string::npos) << reason();
+  EXPECT_FALSE(sealed());
+  putSnapshot({kUUID1, kUUID2});
+  device().takeCounters();
+  save({sealJob()});
+  EXPECT_TRUE(sealed()) << reason();
+  EXPECT_LE(device().takeCounters().statements, 2U);
+
+  ASSERT_TRUE(platform().files().removeItem(device_paths::kLastSynced, nullptr));
+  transaction([&] { library().assetWithUUID(kUUID2)->deleteObject(); });
+  save({sealJob()});
+  EXPECT_FALSE(sealed());
+  EXPECT_NE(reason().find(kUUID2 + " is not in the library"), std::string::npos) << reason();
+}
+
+TEST_F(SealTest, WhatAnotherProgramHasWrittenIsSeen) {
+  putSnapshot({kUUID1});
+  save({importJob(kUUID1, kJpeg)});
+  device().readAhead();
+  device().drain();
+  read([&] { library().managedObjectContext().fetchAssets({}, nullptr); });
+  {
+    SqliteDatabase other(at(device_paths::kDatabase), SqliteDatabase::Access::kReadWrite);
+    other.execute("UPDATE assets SET incomplete = 1");
+  }
+  save({sealJob()});
+  EXPECT_FALSE(sealed());
+  EXPECT_NE(reason().find("is incomplete"), std::string::npos) << reason();
 }
 
 TEST_F(SealTest, IsWithheldForAMissingAsset) {

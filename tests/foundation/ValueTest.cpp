@@ -214,6 +214,26 @@ TEST(DeepValue, ComparisonOfSharedContainersStaysCheap) {
   EXPECT_LT(make().description().size(), std::size_t{2} << 20);
 }
 
+TEST(Dictionary, RoomForManyChangesNothing) {
+  for (const std::size_t room : {0U, 1U, 13U, 1000U}) {
+    Dictionary dictionary;
+    for (int i = 0; i < 20; ++i) {
+      if (i == 5 || i == 15) dictionary.reserve(room);
+      dictionary.set(Value::string("key " + std::to_string(i)), Value::integer(i));
+      if (i > 3) dictionary.set("key 3", Value::integer(-3));
+      dictionary.remove("key 4");
+    }
+    ASSERT_EQ(dictionary.size(), 19U) << room;
+    for (int i = 0; i < 19; ++i) {
+      const int number = i < 4 ? i : i + 1;
+      const std::string key = "key " + std::to_string(number);
+      EXPECT_EQ(dictionary.keyAt(static_cast<std::size_t>(i)), key);
+      EXPECT_EQ(dictionary.find(key), Value::integer(number == 3 ? -3 : number));
+    }
+    EXPECT_FALSE(dictionary.contains("key 4"));
+  }
+}
+
 TEST(Dictionary, KeepsInsertionOrderAndPlaceOfReplacedKeys) {
   Dictionary dictionary{{"b", Value::integer(1)}, {"a", Value::integer(2)}};
   dictionary.set("c", Value::integer(3));
