@@ -47,7 +47,7 @@ class AlbumLists {
  public:
   void add(const std::shared_ptr<StoredAlbum>& album) {
     if (first_ + count_ == room_) begin();
-    piece_[first_ + count_++] = album;
+    piece_.get()[first_ + count_++] = album;
   }
   // Ends a list and tells its length.
   std::uint32_t end(std::shared_ptr<const KXGenericAlbumPtr[]>* list) {
