@@ -288,8 +288,9 @@ int DeviceRoot::makeDirectories(const std::string& path) const {
   return S_ISDIR(made.st_mode) ? 0 : ENOTDIR;
 }
 
-TemporaryFile::~TemporaryFile() {
+void TemporaryFile::remove() {
   if (!name_.empty()) ::unlinkat(parent_.get(), name_.c_str(), 0);
+  name_.clear();
 }
 
 int TemporaryFile::putInPlace() {
@@ -318,6 +319,7 @@ int DeviceRoot::writeTemporary(const std::string& path, std::span<const std::uin
   if (failed == 0 && ::fsync(file.get()) != 0) failed = errno;
   if (failed == 0 && ::fstat(file.get(), &out->status_) != 0) failed = errno;
   if (const int closing = file.close(); failed == 0) failed = closing;
+  if (failed != 0) out->remove();  // at once: where it failed there may be no room
   return failed;
 }
 

@@ -42,12 +42,14 @@ class TemporaryFile {
   TemporaryFile() = default;
   TemporaryFile(const TemporaryFile&) = delete;
   TemporaryFile& operator=(const TemporaryFile&) = delete;
-  ~TemporaryFile();
+  ~TemporaryFile() { remove(); }
   // Renames it and syncs the directory: 0, or an errno. Once.
   [[nodiscard]] int putInPlace();
 
  private:
   friend class DeviceRoot;
+  void remove();
+
   UniqueFd parent_;
   std::string name_;  // empty: there is none
   std::string leaf_;

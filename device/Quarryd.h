@@ -45,7 +45,7 @@ class Quarryd {
   // takes in the camera's files that the library does not know, and the albums of the backup.
   void finalizeRestore(bool recreateAlbums);
   // A hint: the snapshot in place will have to be proved. What that takes of the snapshot is read
-  // meanwhile.
+  // meanwhile, and the seal is written beside its place.
   void expectSeal();
   // While a restore runs no sync is sealed.
   void setRestoring(bool restoring) { restoring_ = restoring; }

@@ -1,3 +1,6 @@
+#include <sys/resource.h>
+
+#include <csignal>
 #include <filesystem>
 #include <random>
 
@@ -115,6 +118,30 @@ TEST(DeviceFileSystemTest, AFileThatHasChangedIsReadAnew) {
   data = nullptr;
   EXPECT_TRUE(gone.expired());
   EXPECT_EQ(text(), a);
+}
+
+TEST(DeviceFileSystemTest, WhatHasNoRoomLeavesNothing) {
+  TemporaryDirectory directory;
+  DeviceFileSystem files(DeviceRoot::open(directory.path(), false, nullptr), false);
+  rlimit before = {};
+  ASSERT_EQ(::getrlimit(RLIMIT_FSIZE, &before), 0);
+  const rlimit small{1 << 20, before.rlim_max};
+  const auto handler = std::signal(SIGXFSZ, SIG_IGN);
+  ASSERT_EQ(::setrlimit(RLIMIT_FSIZE, &small), 0);
+  const std::string text(2 << 20, 'a');
+  const auto data = std::make_shared<const Data>(text.data(), text.size());
+  const auto prepared = files.prepareFile("/f", data);
+  EXPECT_TRUE(fs::is_empty(directory.path()));
+  ErrorPtr error;
+  EXPECT_FALSE(prepared->putInPlace(&error));
+  EXPECT_TRUE(fs::is_empty(directory.path()));
+  ASSERT_EQ(::setrlimit(RLIMIT_FSIZE, &before), 0);
+  std::signal(SIGXFSZ, handler);
+  ASSERT_NE(error, nullptr);
+  EXPECT_EQ(error->code(), EFBIG);
+  // There is room again.
+  EXPECT_TRUE(prepared->putInPlace(nullptr));
+  EXPECT_TRUE(files.fileHolds("/f", data->span()));
 }
 
 TEST(DeviceFileSystemTest, AReadOnlyOnePreparesNothing) {
