@@ -13,8 +13,9 @@ namespace kx {
 // Tokens that differ by less are one and the same.
 inline constexpr double kTokenEpsilon = 2.220446049250313e-16;
 
-// The sort tokens of the host's assets, by UUID. One thread at a time. It keeps the map of the
-// assets, which does not change meanwhile.
+// The sort tokens of the host's assets, by UUID: seconds since the reference date, and a fraction
+// that tells equal neighbours apart. One thread at a time. It keeps the map of the assets, which
+// does not change meanwhile.
 class SortTokens {
  public:
   explicit SortTokens(KXSAssetMapPtr assets)

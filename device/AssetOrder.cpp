@@ -9,8 +9,8 @@
 namespace kx {
 namespace {
 
-// Tags are kept in the database, so the seed stays. With another one, or another way to hash, every
-// album is looked through once more.
+// Tags are kept in the database, so the seed stays. With another one, or another way to hash, an
+// album is looked through in every sync until a member joins or moves.
 constexpr HashSeed kTagSeed{0xcbf29ce484222325ULL, 0x100000001b3ULL};
 
 }  // namespace

@@ -36,7 +36,7 @@ class UniqueFd {
 };
 
 // A file that is written and synced beside the place where it is to be; removed when it goes before
-// it is put there.
+// it is put there. One thread at a time; it needs the root no longer.
 class TemporaryFile {
  public:
   TemporaryFile() = default;
