@@ -72,8 +72,15 @@ struct KXSyncClient::AssetReconciliation {
   const KXSAssetMap& hostAssets;
   DeviceAssets deviceAssets;
   DeviceAlbumMap deviceAlbums = {};
-  std::optional<Memberships> memberships = std::nullopt;
 };
+
+Memberships& KXSyncClient::memberships() {
+  if (!memberships_) {
+    if (!hostWork_.memberships.valid()) startHostWork();
+    memberships_.emplace(hostWork_.memberships.get());
+  }
+  return *memberships_;
+}
 
 const KXSAssetMap& KXSyncClient::hostAssets() const {
   return uuidToKXSAsset_ ? *uuidToKXSAsset_ : kNoAssets;
@@ -160,8 +167,7 @@ void KXSyncClient::updateAssets(AssetReconciliation& run) {
   for (DeviceAssets::Entry& entry : run.deviceAssets.entries()) {
     if (entry.asset) pairs.push_back({&entry.asset, entry.host, entry.place});
   }
-  run.memberships = hostWork_.memberships.get();
-  run.memberships->setPairs(pairs);
+  memberships().setPairs(pairs);
   for (std::size_t i = 0; i < pairs.size(); ++i) {
     const AssetPair& pair = pairs[i];
     const std::string_view uuid = pair.host->key.stringValue();
@@ -234,7 +240,7 @@ void KXSyncClient::updateFaces(KXManagedAsset& device, const KXSAsset& host) {
 
 void KXSyncClient::updateAlbums(AssetReconciliation& run, std::size_t index, std::string_view uuid,
                                 const KXManagedAssetPtr& device) {
-  const MembershipChanges& changes = run.memberships->changesFor(index, device->albums());
+  const MembershipChanges& changes = memberships_->changesFor(index, device->albums());
   for (const Value& key : changes.toLeave) {
     const KXGenericAlbumPtr* found = run.deviceAlbums.find(key.stringValue());
     const KXGenericAlbumPtr album = found != nullptr ? *found : nullptr;

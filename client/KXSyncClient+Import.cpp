@@ -104,9 +104,9 @@ KXSyncSaveJobPtr KXSyncClient::saveJobForRequest(const FRAsset& request) {
 std::vector<std::string> KXSyncClient::albumURIsForAsset(std::string_view uuid,
                                                          OptionalString eventUUID) {
   std::vector<std::string> uris;
-  if (!albumsAndEvents_) return uris;
-  if (!containerIndex_) containerIndex_.emplace(*albumsAndEvents_);
-  for (const std::string_view container : containerIndex_->containersOf(uuid, eventUUID)) {
+  KXSAssetMap::Cursor cursor;
+  if (!albumsAndEvents_ || hostAssets().find(uuid, cursor) == nullptr) return uris;
+  for (const std::string_view container : memberships().containersOf(cursor.place(), eventUUID)) {
     const std::string* uri = _albumURIForAlbumUUID(container);
     if (uri != nullptr) uris.push_back(*uri);
   }

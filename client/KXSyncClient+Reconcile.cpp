@@ -194,7 +194,7 @@ void KXSyncClient::reconcileSnapshot(const KXSLibraryChangeSnapshotPtr& snapshot
   const KXSItemMapPtr& items = snapshot->albumsAndEventsByUUID();
   setAlbumsAndEvents(items ? std::make_shared<KXSItemMap>(*items) : nullptr);
   _pullOutMasterAlbumFromAlbumsAndEvents();
-  uuidToKXSAsset_ = snapshot->assetsByUUID();
+  setUuidToKXSAsset(snapshot->assetsByUUID());
   snapshot_ = snapshot;
   isResync_ = isResync;
   _reconcileMetadata();

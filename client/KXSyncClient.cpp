@@ -118,7 +118,7 @@ void KXSyncClient::_clearSyncState() {
   KX_LOG(kClientSource, "_clearSyncState", LogLevel::kInfo, "Clearing sync state");
   _stopListeningToMemoryPressureEvents();
   setAlbumsAndEvents(nullptr);
-  uuidToKXSAsset_ = nullptr;
+  setUuidToKXSAsset(nullptr);
   snapshot_ = nullptr;
   setOutstandingAssets(nullptr);
   albumURIs_ = std::nullopt;
@@ -147,7 +147,10 @@ void KXSyncClient::setOutstandingSyncJobs(std::optional<SaveJobs> jobs) {
   outstandingSyncJobs_ = std::move(jobs);
 }
 
-void KXSyncClient::setUuidToKXSAsset(KXSAssetMapPtr assets) { uuidToKXSAsset_ = std::move(assets); }
+void KXSyncClient::setUuidToKXSAsset(KXSAssetMapPtr assets) {
+  uuidToKXSAsset_ = std::move(assets);
+  memberships_ = std::nullopt;
+}
 
 void KXSyncClient::setLibraryChangeSnapshot(KXSLibraryChangeSnapshotPtr snapshot) {
   snapshot_ = std::move(snapshot);
@@ -159,7 +162,7 @@ void KXSyncClient::setRestorePathToAssetGroup(std::shared_ptr<AssetGroupMap> gro
 
 void KXSyncClient::setAlbumsAndEvents(KXSItemMapPtr items) {
   albumsAndEvents_ = std::move(items);
-  containerIndex_ = std::nullopt;
+  memberships_ = std::nullopt;
 }
 
 void KXSyncClient::setRestoreContext(std::optional<Dictionary> context) {

@@ -11,9 +11,9 @@
 #include <vector>
 
 #include "client/BlockFailure.h"
-#include "client/ContainerIndex.h"
 #include "client/HostWork.h"
 #include "client/KXSyncAssetGroup.h"
+#include "client/Memberships.h"
 #include "client/TransferList.h"
 #include "platform/Platform.h"
 #include "platform/foundation/OrderedMap.h"
@@ -209,6 +209,7 @@ class KXSyncClient final : public FRClient {
 
   // Asset reconciliation.
   const KXSAssetMap& hostAssets() const;
+  Memberships& memberships();
   void reconcileAssetsInTransaction();
   void deleteAssets(AssetReconciliation& run);
   void requestNewAssets(AssetReconciliation& run);
@@ -277,8 +278,8 @@ class KXSyncClient final : public FRClient {
   std::shared_ptr<AssetGroupMap> restoreGroups_;  // restorePathToAssetGroup
   std::optional<Dictionary> restoreContext_;
   bool syncRequested_ = false;
-  std::optional<ContainerIndex> containerIndex_;  // of albumsAndEvents_, made at the first import
-  BlockFailure* blockFailure_ = nullptr;          // of the caller who waits for submitted blocks
+  std::optional<Memberships> memberships_;  // of albumsAndEvents_, when first needed
+  BlockFailure* blockFailure_ = nullptr;    // of the caller who waits for submitted blocks
 };
 
 }  // namespace kx

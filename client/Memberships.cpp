@@ -1,5 +1,7 @@
 #include "client/Memberships.h"
 
+#include <algorithm>
+
 namespace kx {
 
 std::uint32_t Memberships::numberOf(const Value& key) {
@@ -21,11 +23,12 @@ Memberships::Memberships(const KXSAssetMap& hostAssets, const KXSItemMap& albums
   std::vector<Membership> found;
   KXSAssetMap::Cursor cursor;
   for (const auto& entry : albumsAndEvents) {
+    const std::uint32_t number = numberOf(entry.key);
+    isEvent_.push_back(dynamic_cast<const KXSEvent*>(entry.value.get()) != nullptr);
     const auto* album = dynamic_cast<const KXSAlbum*>(entry.value.get());
     if (album == nullptr) continue;
     const std::optional<ArrayView> uuids = album->assetUUIDs();
     if (!uuids) continue;
-    const std::uint32_t number = numberOf(entry.key);
     for (std::size_t i = 0; i < uuids->size(); ++i) {
       if (hostAssets.find(*uuids->stringAt(i, kKXSAlbumAssetUUIDsKey), cursor) == nullptr) continue;
       found.push_back({static_cast<std::uint32_t>(cursor.place()), number});
@@ -55,8 +58,7 @@ const MembershipChanges& Memberships::changesFor(std::size_t pair,
   changes_.toLeave.clear();
   changes_.toJoin.clear();
   const auto [place, event] = pairs_[pair];
-  const std::span<const std::uint32_t> albums(albums_.data() + starts_[place],
-                                              starts_[place + 1] - starts_[place]);
+  const std::span<const std::uint32_t> albums = albumsAt(place);
   if (event != kNone) atHost_[event] = round_;
   for (const std::uint32_t album : albums) atHost_[album] = round_;
 
@@ -77,6 +79,22 @@ const MembershipChanges& Memberships::changesFor(std::size_t pair,
   if (event != kNone) join(event);
   for (const std::uint32_t album : albums) join(album);
   return changes_;
+}
+
+std::vector<std::string_view> Memberships::containersOf(std::size_t place,
+                                                        OptionalString event) const {
+  const std::span<const std::uint32_t> albums = albumsAt(place);
+  std::vector<std::uint32_t> numbers(albums.begin(), albums.end());
+  const std::uint32_t* const number = event ? numbers_.find(*event) : nullptr;
+  if (number != nullptr && *number < isEvent_.size() && isEvent_[*number]) {
+    numbers.push_back(*number);
+  }
+  std::sort(numbers.begin(), numbers.end());
+  numbers.erase(std::unique(numbers.begin(), numbers.end()), numbers.end());
+  std::vector<std::string_view> keys;
+  keys.reserve(numbers.size());
+  for (const std::uint32_t each : numbers) keys.push_back(keys_[each].stringValue());
+  return keys;
 }
 
 }  // namespace kx

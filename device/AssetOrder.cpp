@@ -3,6 +3,7 @@
 #include <cerrno>
 
 #include "device/DeviceLayout.h"
+#include "platform/foundation/EntryPeek.h"
 #include "platform/foundation/Hash.h"
 #include "platform/foundation/PropertyList.h"
 
@@ -15,20 +16,27 @@ constexpr HashSeed kTagSeed{0xcbf29ce484222325ULL, 0x100000001b3ULL};
 
 }  // namespace
 
-AssetOrder::Album::Album(DictionaryView indexes) : indexes_(std::move(indexes)) {
-  std::uint64_t tag = indexes_->size();
-  for (std::size_t i = 0; i < indexes_->size(); ++i) {
-    const std::string_view uuid = indexes_->keyAt(i);
-    const Value value = indexes_->valueAt(i);
+AssetOrder::Album::Album(Value indexes) : indexes_(std::move(indexes)) {
+  const DictionaryView view = indexes_.dictionaryValue();
+  std::uint64_t tag = view.size();
+  for (std::size_t i = 0; i < view.size(); ++i) {
+    const std::string_view uuid = view.keyAt(i);
+    const Value value = view.valueAt(i);
     const std::uint64_t index = value.isNumber() ? value.numberValue().uint64Value() : 0;
     tag = hashNumber(hashBytes(uuid.data(), uuid.size(), kTagSeed) ^ tag, index, kTagSeed);
   }
   tag_ = static_cast<std::int64_t>(tag | 1U);
 }
 
-std::optional<std::int64_t> AssetOrder::Album::indexOf(std::string_view assetUUID) const {
-  if (!indexes_) return std::nullopt;
-  const Value value = indexes_->find(assetUUID);
+std::optional<std::int64_t> AssetOrder::Album::indexOf(std::string_view assetUUID,
+                                                       std::uint32_t expected) const {
+  if (EntryPeek::can(indexes_)) {
+    // The entries stand in the order of their indexes.
+    const auto found = EntryPeek::find(indexes_, assetUUID, expected);
+    if (!found || found->kind() != Kind::kNumber) return std::nullopt;
+    return found->number().int64Value();
+  }
+  const Value value = indexes_[assetUUID];
   if (!value.isNumber()) return std::nullopt;
   return value.numberValue().int64Value();
 }
@@ -39,8 +47,7 @@ std::shared_ptr<const AssetOrder::Album> AssetOrder::album(const std::optional<s
   if (const auto known = albums_.find(*uuid); known != albums_.end()) return known->second;
   const Value order = orders_[*uuid];
   if (!order.isDictionary()) return none_;
-  return albums_.emplace(*uuid, std::make_shared<const Album>(order.dictionaryValue()))
-      .first->second;
+  return albums_.emplace(*uuid, std::make_shared<const Album>(order)).first->second;
 }
 
 void AssetOrder::read() {

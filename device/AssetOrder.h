@@ -24,12 +24,15 @@ class AssetOrder {
   class Album {
    public:
     Album() = default;
-    explicit Album(DictionaryView indexes);
+    // A dictionary: by UUID the index.
+    explicit Album(Value indexes);
     std::int64_t tag() const { return tag_; }
-    std::optional<std::int64_t> indexOf(std::string_view assetUUID) const;
+    // Null for an asset that is not named. Found fastest when it has the index that is expected.
+    std::optional<std::int64_t> indexOf(std::string_view assetUUID,
+                                        std::uint32_t expected = 0) const;
 
    private:
-    std::optional<DictionaryView> indexes_;
+    Value indexes_;  // null: none
     std::int64_t tag_ = 0;
   };
 

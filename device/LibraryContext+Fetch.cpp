@@ -109,7 +109,6 @@ void LibraryContext::readAhead(const std::atomic<bool>& wanted) {
     readAssets({}, &ahead.assets);
     prefetchFaces(ahead.assets);
     prefetchAlbums(ahead.assets);
-    ahead.changes = store_->assetChanges();
     ahead.albumsEpoch = albumsEpoch_;
     if (wanted) ahead_ = std::move(ahead);
   } catch (const SqliteError&) {
@@ -120,16 +119,28 @@ void LibraryContext::readAhead(const std::atomic<bool>& wanted) {
 
 bool LibraryContext::isReadAhead(const AssetPredicate& predicate) const {
   const AssetPredicate synced;
-  return ahead_ && ahead_->changes == store_->assetChanges() && changedAssets_.empty() &&
-         changedFaces_.empty() && memberships_.empty() &&
-         predicate.comparison == synced.comparison &&
+  return ahead_ && ahead_->changed.empty() && changedAssets_.empty() && changedFaces_.empty() &&
+         memberships_.empty() && predicate.comparison == synced.comparison &&
          predicate.savedAssetType == synced.savedAssetType;
 }
 
+void LibraryContext::noteWritten(const RowChanges& rows) {
+  if (!ahead_) return;
+  ahead_->changed.insert(rows.assets.begin(), rows.assets.end());
+  ahead_->changed.insert(rows.deletedAssets.begin(), rows.deletedAssets.end());
+  // Too little is left to be of use.
+  if (ahead_->changed.size() > ahead_->assets.size() / 2) ahead_.reset();
+}
+
 bool LibraryContext::showRowsReadAhead(const std::function<bool(const AssetRow&)>& visit) {
-  if (!isReadAhead({}) || ahead_->dataVersion != store_->dataVersion()) return false;
+  if (!ahead_ || ahead_->dataVersion != store_->dataVersion()) return false;
   for (const KXManagedAssetPtr& asset : ahead_->assets) {
-    if (!visit(static_cast<const StoredAsset&>(*asset).saved())) break;
+    const auto& stored = static_cast<const StoredAsset&>(*asset);
+    if (!ahead_->changed.contains(stored.pk_) && !visit(stored.saved())) return true;
+  }
+  for (const RowId pk : ahead_->changed) {
+    const std::optional<AssetRow> row = assetRow(store_->database(), pk);
+    if (row && row->savedType == AssetPredicate().savedAssetType && !visit(*row)) return true;
   }
   return true;
 }

@@ -8,6 +8,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <unordered_set>
 #include <utility>
 #include <vector>
 
@@ -50,8 +51,9 @@ class LibraryContext : public KXManagedObjectContext {
   void readAhead(const std::atomic<bool>& wanted);
 
   // Shows the row of every synced asset, as long as the visitor wants more of them, if all were
-  // read ahead and neither this program nor another has changed the library's assets since.
-  // Otherwise false, and none is shown.
+  // read ahead and no other program has changed the library since: as it was read, or when a
+  // transaction has changed it, as the table has it now. Otherwise false, and none is shown. Throws
+  // SqliteError.
   bool showRowsReadAhead(const std::function<bool(const AssetRow&)>& visit);
 
   // What KXPhotoLibrary's class operations need.
@@ -68,6 +70,8 @@ class LibraryContext : public KXManagedObjectContext {
   // Writes what has changed as one transaction. After an error everything is as it was saved last.
   ErrorPtr save();
   void dropChanges();
+  // A transaction, its own or another's, has changed these rows.
+  void noteWritten(const RowChanges& rows);
   // Another's transaction has changed these rows. Unsaved changes stay.
   void refreshRows(const RowChanges& rows);
 
@@ -99,8 +103,8 @@ class LibraryContext : public KXManagedObjectContext {
   // The synced assets, their faces and albums, as they were read ahead.
   struct Ahead {
     std::vector<KXManagedAssetPtr> assets;
-    std::uint64_t changes = 0;     // the store's assetChanges then
-    std::int64_t dataVersion = 0;  // the database's
+    std::unordered_set<RowId> changed;  // assets that are new, changed or gone since
+    std::int64_t dataVersion = 0;       // the database's
     std::uint32_t albumsEpoch = 0;
   };
 

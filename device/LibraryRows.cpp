@@ -18,6 +18,15 @@ AssetRow readAssetRow(const SqliteStatement& row, int first) {
   return asset;
 }
 
+std::optional<AssetRow> assetRow(SqliteDatabase& database, RowId pk) {
+  SqliteStatement row(database,
+                      "SELECT uuid, saved_type, is_video, incomplete, modification_date, "
+                      "sort_token, latitude, longitude FROM assets WHERE pk = ?");
+  row.integer(pk);
+  if (!row.step()) return std::nullopt;
+  return readAssetRow(row, 0);
+}
+
 FaceRow readFaceRow(const SqliteStatement& row, int first) {
   FaceRow face;
   face.identifier = static_cast<std::uint16_t>(row.integerAt(first));

@@ -62,6 +62,7 @@ inline bool isSyncedKind(std::int32_t kind) {
          kind == kKXAlbumKindSyncedFaceAlbum;
 }
 
+class SqliteDatabase;
 class SqliteStatement;
 // Rows as the columns from `first` on hold them: uuid, saved_type, is_video, incomplete,
 // modification_date, sort_token, latitude, longitude; identifier, x, y, width, height, album_uuid;
@@ -69,6 +70,8 @@ class SqliteStatement;
 AssetRow readAssetRow(const SqliteStatement& row, int first);
 FaceRow readFaceRow(const SqliteStatement& row, int first);
 AlbumRow readAlbumRow(const SqliteStatement& row, int first);
+// As the table has it now; null for an asset that is not there. Throws SqliteError.
+std::optional<AssetRow> assetRow(SqliteDatabase& database, RowId pk);
 
 // Which rows one committed transaction has touched, so that contexts can refresh them.
 struct RowChanges {

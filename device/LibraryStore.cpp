@@ -100,8 +100,8 @@ void LibraryStore::published(LibraryWriter& writer, const LibraryContext* origin
     changes_.deletedContainers.merge(news.deletedContainers);
     changes_.renamedContainers.merge(news.renamedContainers);
   }
-  if (!writer.rows().assets.empty() || !writer.rows().deletedAssets.empty()) ++assetChanges_;
   for (LibraryContext* context : contexts_) {
+    context->noteWritten(writer.rows());
     if (context != origin) context->refreshRows(writer.rows());
   }
   if (releaser_ && !writer.releasedFiles().empty()) releaser_(std::move(writer.releasedFiles()));

@@ -57,9 +57,6 @@ class LibraryStore {
     releaser_ = std::move(releaser);
   }
 
-  // Grows with every transaction that has changed assets, their faces or memberships.
-  std::uint64_t assetChanges() const { return assetChanges_; }
-
   // Another number as soon as another program has changed the database.
   std::int64_t dataVersion();
   // As LibraryContext, of the first context that can.
@@ -97,7 +94,6 @@ class LibraryStore {
   std::function<void(std::vector<std::string>)> releaser_;
   std::function<void()> onCommit_;
   std::uint64_t listSorts_ = 0;
-  std::uint64_t assetChanges_ = 0;
   bool isReading_ = false;
   DeviceCounters counted_;
   std::mutex changesMutex_;

@@ -79,13 +79,15 @@ std::vector<Member> LibraryWriter::membersOf(RowId album, const AssetOrder::Albu
   std::vector<Member> members;
   SqliteStatement row(database_, "SELECT asset, position FROM memberships WHERE album = ?");
   row.integer(album);
+  std::uint32_t next = 0;
   while (row.step()) {
     Member member{row.integerAt(0), std::nullopt, row.optionalIntegerAt(1)};
     if (order.tag() != 0) {
       withAsset(member.asset, [&](std::string_view uuid, const std::optional<double>&) {
-        member.index = order.indexOf(uuid);
+        member.index = order.indexOf(uuid, next);
       });
     }
+    if (member.index) next = static_cast<std::uint32_t>(*member.index) + 1;  // mostly
     members.push_back(member);
   }
   return members;
@@ -169,8 +171,9 @@ void LibraryWriter::forgetPlaces(RowId asset) {
 
 void LibraryWriter::addMembership(RowId album, RowId asset, std::string_view assetUUID) {
   AlbumOrderState& state = orderState(album);
-  putInOrder(album, state);
   std::optional<std::int64_t> position = state.order->indexOf(assetUUID);
+  // One that has no place says nothing about the others', and needs none of them.
+  if (position || !state.tagged) putInOrder(album, state);
   if (position) position = placeOf(album, state, *position);
   SqliteStatement(database_,
                   "INSERT OR IGNORE INTO memberships(album, asset, position) "

@@ -73,15 +73,12 @@ void StoredFace::die() {
 const AssetRow& StoredAsset::saved() const {
   if (life_ == Life::kGone || context_ == nullptr) return kGoneAsset;
   if (!loaded_) {
-    SqliteStatement row(context_->store().database(),
-                        "SELECT uuid, saved_type, is_video, incomplete, modification_date, "
-                        "sort_token, latitude, longitude FROM assets WHERE pk = ?");
-    row.integer(pk_);
-    if (!row.step()) {
+    std::optional<AssetRow> row = assetRow(context_->store().database(), pk_);
+    if (!row) {
       life_ = Life::kGone;
       return kGoneAsset;
     }
-    load(readAssetRow(row, 0));
+    load(std::move(*row));
   }
   return row_;
 }

@@ -76,8 +76,8 @@ class BundleLibrary final : public HostLibrary {
       throw std::system_error(names().failure, std::generic_category(), kBundleMediaName);
     }
     std::vector<MediaName> result;
-    for (const std::size_t start : names().starts) {
-      const std::string_view name = names().at(start);
+    for (const Name& listed : names().names) {
+      const std::string_view name = names().at(listed);
       if (name.front() == '.') continue;
       std::string uuid(name.substr(0, name.find('.')));
       if (nameOf(uuid) == name) result.push_back({std::move(uuid), std::string(name)});
@@ -92,24 +92,37 @@ class BundleLibrary final : public HostLibrary {
     return false;
   }
 
+  struct Name {
+    std::uint64_t head;  // the first bytes, which mostly tell two names apart
+    std::size_t start;   // in the text
+  };
   // Very many names, in one text.
   struct Names {
-    std::string text;                 // each with its NUL
-    std::vector<std::size_t> starts;  // in the text, the names sorted by bytes
-    int failure = 0;                  // errno when they could not be listed
+    std::string text;         // each with its NUL
+    std::vector<Name> names;  // sorted by bytes
+    int failure = 0;          // errno when they could not be listed
 
-    std::string_view at(std::size_t start) const { return text.c_str() + start; }
+    std::string_view at(const Name& name) const { return text.c_str() + name.start; }
   };
+
+  static std::uint64_t headOf(std::string_view name) {
+    std::uint64_t head = 0;
+    for (std::size_t i = 0; i < sizeof(head); ++i) {
+      head = head << 8 | (i < name.size() ? static_cast<std::uint8_t>(name[i]) : 0U);
+    }
+    return head;
+  }
 
   // The names in media/, listed when first asked for: a sync without new files never does.
   const Names& names() const {
     std::call_once(listed_, [this] {
       names_.failure = forEachName(media_.get(), [this](std::string_view name) {
-        names_.starts.push_back(names_.text.size());
+        names_.names.push_back({headOf(name), names_.text.size()});
         names_.text.append(name).push_back('\0');
       });
-      std::sort(names_.starts.begin(), names_.starts.end(),
-                [this](std::size_t a, std::size_t b) { return names_.at(a) < names_.at(b); });
+      std::sort(names_.names.begin(), names_.names.end(), [this](const Name& a, const Name& b) {
+        return a.head != b.head ? a.head < b.head : names_.at(a) < names_.at(b);
+      });
     });
     return names_;
   }
@@ -120,9 +133,9 @@ class BundleLibrary final : public HostLibrary {
     const Names& names = this->names();
     const auto atLeast = [&names](std::string_view wanted) -> std::string_view {
       const auto found = std::lower_bound(
-          names.starts.begin(), names.starts.end(), wanted,
-          [&names](std::size_t start, std::string_view name) { return names.at(start) < name; });
-      return found == names.starts.end() ? std::string_view() : names.at(*found);
+          names.names.begin(), names.names.end(), wanted,
+          [&names](const Name& name, std::string_view text) { return names.at(name) < text; });
+      return found == names.names.end() ? std::string_view() : names.at(*found);
     };
     if (atLeast(uuid) == uuid) return std::string(uuid);
     const std::string prefix = std::string(uuid) + ".";

@@ -96,6 +96,45 @@ TEST_F(SealTest, RowsThatWereReadAheadProve) {
   EXPECT_NE(reason().find(kUUID2 + " is not in the library"), std::string::npos) << reason();
 }
 
+// Of the other rows nothing is read again.
+TEST_F(SealTest, RowsThatHaveChangedSinceAreReadFromTheTable) {
+  std::vector<KXSyncSaveJobPtr> jobs;
+  std::vector<std::string> uuids;
+  for (int i = 0; i < 20; ++i) {
+    uuids.push_back(std::string("00000000-0000-0000-0000-0000000000") + std::to_string(10 + i));
+    jobs.push_back(importJob(uuids.back(), kJpeg));
+  }
+  save(jobs);
+  device().readAhead();
+  device().drain();
+  read([&] { library().managedObjectContext().fetchAssets({}, nullptr); });
+
+  const auto edit = [&](double modified) {
+    DeviceAssetFields fields;
+    fields.modificationDate = Date{modified};
+    EXPECT_TRUE(device().admin().setAssetFields(library(), uuids[1], fields));
+  };
+
+  // One is new, another one is gone, and one is another now.
+  save({importJob(kUUID1, kJpeg)});
+  transaction([&] {
+    library().assetWithUUID(uuids[0])->deleteObject();
+    edit(7.0);
+  });
+  uuids[0] = kUUID1;
+  putSnapshot(uuids);
+  save({sealJob()});
+  EXPECT_FALSE(sealed());
+  EXPECT_NE(reason().find(uuids[1] + " has another modification date"), std::string::npos)
+      << reason();
+
+  transaction([&] { edit(100.0); });
+  device().takeCounters();
+  save({sealJob()});
+  EXPECT_TRUE(sealed()) << reason();
+  EXPECT_LE(device().takeCounters().statements, 6U);
+}
+
 TEST_F(SealTest, WhatAnotherProgramHasWrittenIsSeen) {
   putSnapshot({kUUID1});
   save({importJob(kUUID1, kJpeg)});

@@ -110,6 +110,25 @@ TEST_F(HostBundle, AFileIsFoundByItsExactNameElseTheFirstByBytes) {
   EXPECT_EQ(names, "A B.JPG BB.JPG C-1.jpg ");
 }
 
+// However much their beginnings are alike.
+TEST_F(HostBundle, NamesAreSortedByBytes) {
+  target_.write("PhotoLibrary.plist", "x");
+  const std::vector<std::string> names = {
+      "A",           "A-1.JPG",        "IMG_2020",    "IMG_2020-1",      "IMG_2020.A",
+      "IMG_2020_10", "IMG_2020_9.JPG", "IMG_202\x7f", "IMG_202\xc3\xa9", "\xc3\xa9"};
+  for (auto name = names.rbegin(); name != names.rend(); ++name)
+    target_.write("media/" + *name, "");
+  const auto bundle = openHost(target_.path());
+  std::vector<std::string> listed;
+  for (const auto& name : bundle->mediaNames()) listed.push_back(name.bundleName);
+  std::vector<std::string> expected = names;
+  std::erase(expected, "IMG_2020.A");  // the asset has a file of its exact name
+  EXPECT_EQ(listed, expected);
+  for (const std::string& name : expected) {
+    EXPECT_TRUE(bundle->mediaSize(name.substr(0, name.find('.'))).has_value()) << name;
+  }
+}
+
 TEST_F(HostBundle, IdentifiersNeverLeadOutOfMedia) {
   target_.write("PhotoLibrary.plist", "x");
   target_.write("media/A", "a");
