@@ -1,4 +1,6 @@
 #include <algorithm>
+#include <future>
+#include <memory>
 
 #include "device/DeviceErrors.h"
 #include "device/LibraryContext.h"
@@ -93,9 +95,11 @@ std::optional<std::vector<KXManagedAssetPtr>> LibraryContext::fetchAssets(
     } else {
       readAssets(request.predicate, &assets);
     }
-    if (request.prefetchFaces && !isAtHand) prefetchFaces(assets);
+    if (request.prefetchFaces && !isAtHand) {
+      takeFaces(readFaces(store_->database(), nullptr), assets);
+    }
     if (request.prefetchAlbums && !(isAtHand && ahead_->albumsEpoch == albumsEpoch_)) {
-      prefetchAlbums(assets);
+      takeAlbums(readMemberships(store_->database(), nullptr), assets);
     }
     return assets;
   });
@@ -103,17 +107,29 @@ std::optional<std::vector<KXManagedAssetPtr>> LibraryContext::fetchAssets(
 
 void LibraryContext::readAhead(const std::atomic<bool>& wanted) {
   wanted_ = &wanted;
+  store_->beginReading();
   try {
     Ahead ahead;
     ahead.dataVersion = store_->dataVersion();
+    // Relations are read beside the assets. Both see the same: what is being read is not written.
+    std::future<RelationRows> beside;
+    if (std::unique_ptr<SqliteDatabase> database = store_->openBeside()) {
+      beside = std::async(std::launch::async, [database = std::move(database), &wanted] {
+        return RelationRows{readFaces(*database, &wanted), readMemberships(*database, &wanted)};
+      });
+    }
     readAssets({}, &ahead.assets);
-    prefetchFaces(ahead.assets);
-    prefetchAlbums(ahead.assets);
+    RelationRows rows = beside.valid() ? beside.get()
+                                       : RelationRows{readFaces(store_->database(), &wanted),
+                                                      readMemberships(store_->database(), &wanted)};
+    takeFaces(std::move(rows.faces), ahead.assets);
+    takeAlbums(rows.albums, ahead.assets);
     ahead.albumsEpoch = albumsEpoch_;
     if (wanted) ahead_ = std::move(ahead);
   } catch (const SqliteError&) {
     // Whoever needs the rows asks again, and tells of the failure.
   }
+  store_->endReading();
   wanted_ = nullptr;
 }
 
@@ -180,19 +196,17 @@ void LibraryContext::readAssets(const AssetPredicate& predicate,
   });
 }
 
-void LibraryContext::prefetchFaces(const std::vector<KXManagedAssetPtr>& assets) {
-  SqliteStatement row(store_->database(),
-                      "SELECT asset, pk, identifier, x, y, width, height, album_uuid FROM faces "
-                      "ORDER BY asset, pk");
-  bool more = nextRow(row);
+void LibraryContext::takeFaces(std::vector<FaceOfAsset> rows,
+                               const std::vector<KXManagedAssetPtr>& assets) {
+  auto row = rows.begin();
   for (const KXManagedAssetPtr& object : assets) {
     StoredAsset& owner = static_cast<StoredAsset&>(*object);
-    while (more && row.integerAt(0) < owner.pk_) more = nextRow(row);
+    while (row != rows.end() && row->asset < owner.pk_) ++row;
     if (owner.facesRead_ || owner.relationsChanged_) continue;
     std::vector<KXManagedFacePtr> found;
-    for (; more && row.integerAt(0) == owner.pk_; more = nextRow(row)) {
-      std::shared_ptr<StoredFace> shown = face(row.integerAt(1), owner.pk_);
-      if (!shown->loaded_) shown->load(readFaceRow(row, 2));
+    for (; row != rows.end() && row->asset == owner.pk_; ++row) {
+      std::shared_ptr<StoredFace> shown = face(row->pk, owner.pk_);
+      if (!shown->loaded_) shown->load(std::move(row->face));
       found.push_back(std::move(shown));
     }
     owner.faces_ = std::move(found);
@@ -200,23 +214,22 @@ void LibraryContext::prefetchFaces(const std::vector<KXManagedAssetPtr>& assets)
   }
 }
 
-void LibraryContext::prefetchAlbums(const std::vector<KXManagedAssetPtr>& assets) {
+void LibraryContext::takeAlbums(const std::vector<AlbumOfAsset>& rows,
+                                const std::vector<KXManagedAssetPtr>& assets) {
   {
     SqliteStatement row(store_->database(),
                         "SELECT pk, uuid, kind, title, pending_type, pending_count, managed "
                         "FROM albums ORDER BY pk");
     while (row.step()) album(row.integerAt(0), row, 1);
   }
-  SqliteStatement row(store_->database(),
-                      "SELECT asset, album FROM memberships ORDER BY asset, album");
-  bool more = nextRow(row);
+  auto row = rows.begin();
   AlbumLists lists;
   for (const KXManagedAssetPtr& object : assets) {
     StoredAsset& owner = static_cast<StoredAsset&>(*object);
-    while (more && row.integerAt(0) < owner.pk_) more = nextRow(row);
+    while (row != rows.end() && row->asset < owner.pk_) ++row;
     if (owner.relationsChanged_) continue;
-    for (; more && row.integerAt(0) == owner.pk_; more = nextRow(row)) {
-      const std::shared_ptr<StoredAlbum>& holder = albums_.at(row.integerAt(1));
+    for (; row != rows.end() && row->asset == owner.pk_; ++row) {
+      const std::shared_ptr<StoredAlbum>& holder = albums_.at(row->album);
       if (!holder->isDeleted()) lists.add(holder);
     }
     owner.albumCount_ = lists.end(&owner.albums_);

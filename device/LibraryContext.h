@@ -110,8 +110,10 @@ class LibraryContext : public KXManagedObjectContext {
 
   bool isReadAhead(const AssetPredicate& predicate) const;
   void readAssets(const AssetPredicate& predicate, std::vector<KXManagedAssetPtr>* assets);
-  void prefetchFaces(const std::vector<KXManagedAssetPtr>& assets);
-  void prefetchAlbums(const std::vector<KXManagedAssetPtr>& assets);
+  // Gives these assets, in row order, their faces and albums of the rows.
+  void takeFaces(std::vector<FaceOfAsset> rows, const std::vector<KXManagedAssetPtr>& assets);
+  void takeAlbums(const std::vector<AlbumOfAsset>& rows,
+                  const std::vector<KXManagedAssetPtr>& assets);
   // The next row of a long reading; none when the reading is not wanted any more.
   bool nextRow(SqliteStatement& row);
   bool isEmptyNow(RowId album);

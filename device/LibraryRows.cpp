@@ -3,6 +3,13 @@
 #include "device/Sqlite.h"
 
 namespace kx {
+namespace {
+
+bool isWanted(const std::atomic<bool>* wanted) {
+  return wanted == nullptr || wanted->load(std::memory_order_relaxed);
+}
+
+}  // namespace
 
 AssetRow readAssetRow(const SqliteStatement& row, int first) {
   AssetRow asset;
@@ -45,6 +52,25 @@ AlbumRow readAlbumRow(const SqliteStatement& row, int first) {
   album.pendingCount = static_cast<std::uint32_t>(row.integerAt(first + 4));
   album.managed = row.integerAt(first + 5) != 0;
   return album;
+}
+
+std::vector<FaceOfAsset> readFaces(SqliteDatabase& database, const std::atomic<bool>* wanted) {
+  std::vector<FaceOfAsset> faces;
+  SqliteStatement row(database,
+                      "SELECT asset, pk, identifier, x, y, width, height, album_uuid FROM faces "
+                      "ORDER BY asset, pk");
+  while (isWanted(wanted) && row.step()) {
+    faces.push_back({row.integerAt(0), row.integerAt(1), readFaceRow(row, 2)});
+  }
+  return faces;
+}
+
+std::vector<AlbumOfAsset> readMemberships(SqliteDatabase& database,
+                                          const std::atomic<bool>* wanted) {
+  std::vector<AlbumOfAsset> albums;
+  SqliteStatement row(database, "SELECT asset, album FROM memberships ORDER BY asset, album");
+  while (isWanted(wanted) && row.step()) albums.push_back({row.integerAt(0), row.integerAt(1)});
+  return albums;
 }
 
 }  // namespace kx

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <atomic>
 #include <cstdint>
 #include <map>
 #include <optional>
@@ -72,6 +73,25 @@ FaceRow readFaceRow(const SqliteStatement& row, int first);
 AlbumRow readAlbumRow(const SqliteStatement& row, int first);
 // As the table has it now; null for an asset that is not there. Throws SqliteError.
 std::optional<AssetRow> assetRow(SqliteDatabase& database, RowId pk);
+
+// What all assets are related to, as the tables hold it: by asset, then row or album.
+struct FaceOfAsset {
+  RowId asset = 0;
+  RowId pk = 0;
+  FaceRow face;
+};
+struct AlbumOfAsset {
+  RowId asset = 0;
+  RowId album = 0;
+};
+struct RelationRows {
+  std::vector<FaceOfAsset> faces;
+  std::vector<AlbumOfAsset> albums;
+};
+// Each ends early when `wanted`, unless it is null, becomes false. They throw SqliteError.
+std::vector<FaceOfAsset> readFaces(SqliteDatabase& database, const std::atomic<bool>* wanted);
+std::vector<AlbumOfAsset> readMemberships(SqliteDatabase& database,
+                                          const std::atomic<bool>* wanted);
 
 // Which rows one committed transaction has touched, so that contexts can refresh them.
 struct RowChanges {

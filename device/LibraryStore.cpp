@@ -6,6 +6,7 @@
 
 #include "device/DeviceErrors.h"
 #include "device/LibraryContext.h"
+#include "device/LibrarySchema.h"
 
 namespace kx {
 namespace {
@@ -38,6 +39,13 @@ void LibraryStore::beginReading() {
 
 void LibraryStore::endReading() {
   if (std::exchange(isReading_, false)) database().endReading();
+}
+
+std::unique_ptr<SqliteDatabase> LibraryStore::openBeside() {
+  // What a plan has changed is not committed.
+  if (parts_.planOnly ? database().rowsWritten() != 0 : !isReading_) return nullptr;
+  const std::string path = database().path();
+  return path.empty() ? nullptr : openLibraryForReading(path, nullptr).database;
 }
 
 ErrorPtr LibraryStore::write(const Work& work, const LibraryContext* origin) {

@@ -48,6 +48,10 @@ class LibraryStore {
   void beginReading();
   void endReading();
 
+  // Another connection, for reading on another thread what this one sees, as long as this one is
+  // reading and writes nothing. Null when there can be none.
+  std::unique_ptr<SqliteDatabase> openBeside();
+
   using Work = std::function<void(LibraryWriter&)>;
   // One write transaction: all of the work or, with an error, nothing of it. A failure is noted in
   // the device's health. After the commit every open context but `origin` has been refreshed.

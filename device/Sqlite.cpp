@@ -151,6 +151,11 @@ void SqliteDatabase::refuseCommits() {
       connection_, [](void*) { return 1; }, nullptr);
 }
 
+std::string SqliteDatabase::path() const {
+  const char* const path = sqlite3_db_filename(connection_, "main");
+  return path == nullptr ? std::string() : path;
+}
+
 std::uint64_t SqliteDatabase::rowsWritten() const {
   return static_cast<std::uint64_t>(sqlite3_total_changes64(connection_));
 }

@@ -60,6 +60,8 @@ class SqliteDatabase {
   // transaction of the target: SQLite's online backup. Good while others read either of them. Asked
   // between steps, `goOn` ends it (SQLITE_INTERRUPT) by saying no.
   void copyTo(SqliteDatabase& target, const std::function<bool()>& goOn = {});
+  // Of the file; empty for a database in memory.
+  std::string path() const;
   std::uint64_t statementsRun() const { return statementsRun_; }
   std::uint64_t rowsWritten() const;
 
