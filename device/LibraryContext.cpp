@@ -134,6 +134,14 @@ ErrorPtr LibraryContext::save() {
   return failure;
 }
 
+std::optional<LibraryWriter::AssetAtHand> LibraryContext::savedAtHand(RowId pk) const {
+  const StoredAsset* const known = assets_.peek(pk);
+  if (known == nullptr || !known->loaded_ || known->life_ == StoredAsset::Life::kGone) {
+    return std::nullopt;
+  }
+  return LibraryWriter::AssetAtHand{known->row_.uuid, known->row_.sortToken};
+}
+
 std::optional<LibraryWriter::AssetAtHand> LibraryContext::assetAtHand(RowId pk) const {
   const StoredAsset* const known = assets_.peek(pk);
   if (known == nullptr || !known->loaded_ || known->isDeleted()) return std::nullopt;

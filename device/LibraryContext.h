@@ -70,6 +70,8 @@ class LibraryContext : public KXManagedObjectContext {
   // Writes what has changed as one transaction. After an error everything is as it was saved last.
   ErrorPtr save();
   void dropChanges();
+  // Of an asset as it was saved last, if it is at hand.
+  std::optional<LibraryWriter::AssetAtHand> savedAtHand(RowId pk) const;
   // A transaction, its own or another's, has changed these rows.
   void noteWritten(const RowChanges& rows);
   // Another's transaction has changed these rows. Unsaved changes stay.

@@ -54,6 +54,7 @@ ErrorPtr LibraryStore::write(const Work& work, const LibraryContext* origin) {
   if (parts_.readOnly) failure = systemError("cannot write", "the library", EROFS);
   if (!failure) {
     LibraryWriter writer(database(), order_, positions_);
+    writer.setAtHand([&](RowId asset) { return savedAtHand(asset, writer.rows()); });
     try {
       database().execute(parts_.planOnly ? "SAVEPOINT work" : "BEGIN IMMEDIATE");
       work(writer);
@@ -85,6 +86,16 @@ ErrorPtr LibraryStore::write(const Work& work, const LibraryContext* origin) {
   }
   health().noteFailure("a library transaction was rolled back", failure);
   return failure;
+}
+
+// What the transaction has changed by now is left to the table.
+std::optional<LibraryWriter::AssetAtHand> LibraryStore::savedAtHand(
+    RowId asset, const RowChanges& changed) const {
+  if (changed.assets.contains(asset)) return std::nullopt;
+  for (const LibraryContext* context : contexts_) {
+    if (auto known = context->savedAtHand(asset)) return known;
+  }
+  return std::nullopt;
 }
 
 std::int64_t LibraryStore::dataVersion() {

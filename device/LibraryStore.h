@@ -84,6 +84,8 @@ class LibraryStore {
   DeviceCounters takeCounters();
 
  private:
+  std::optional<LibraryWriter::AssetAtHand> savedAtHand(RowId asset,
+                                                        const RowChanges& changed) const;
   void published(LibraryWriter& writer, const LibraryContext* origin);
   void onQueue(const Block& block);
 

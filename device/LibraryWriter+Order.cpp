@@ -23,6 +23,22 @@ bool sayTheOrder(const std::vector<Member>& members) {
   return differ(&Member::stored) && differ(&Member::index);
 }
 
+// Whether a member that is to have no position, and so to stand behind those that have one, stands
+// before one of these.
+bool standsBeforePlaced(const std::vector<Member>& members) {
+  std::optional<std::int64_t> first;  // of those without
+  std::optional<std::int64_t> last;   // of those with one
+  for (const Member& member : members) {
+    if (!member.stored) continue;
+    if (member.index) {
+      last = std::max(last.value_or(*member.stored), *member.stored);
+    } else {
+      first = std::min(first.value_or(*member.stored), *member.stored);
+    }
+  }
+  return first && last && *first < *last;
+}
+
 // A member with all that the order inside an album depends on.
 struct WholeMember {
   std::string uuid;
@@ -95,6 +111,7 @@ std::vector<Member> LibraryWriter::membersOf(RowId album, const AssetOrder::Albu
 
 // Whether the members stand in the order all the same, whatever their positions.
 bool LibraryWriter::isInOrder(const std::vector<Member>& members) {
+  if (standsBeforePlaced(members)) return false;
   std::vector<WholeMember> whole;
   whole.reserve(members.size());
   for (const Member& member : members) {

@@ -39,8 +39,8 @@ class LibraryWriter {
   LibraryWriter(SqliteDatabase& database, AssetOrder& order, KnownAlbumPositions& positions)
       : database_(database), order_(order), knownPositions_(positions) {}
 
-  // What the order inside an album depends on. Spares a look into the table for each asset of which
-  // it is at hand.
+  // What the order inside an album depends on, as this transaction has it by now. Spares a look
+  // into the table for each asset of which it is at hand.
   struct AssetAtHand {
     std::string_view uuid;
     std::optional<double> sortToken;
