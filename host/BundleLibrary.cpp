@@ -132,9 +132,12 @@ class BundleLibrary final : public HostLibrary {
     if (!isOneComponent(uuid)) return {};
     const Names& names = this->names();
     const auto atLeast = [&names](std::string_view wanted) -> std::string_view {
-      const auto found = std::lower_bound(
-          names.names.begin(), names.names.end(), wanted,
-          [&names](const Name& name, std::string_view text) { return names.at(name) < text; });
+      const std::uint64_t head = headOf(wanted);
+      const auto found =
+          std::lower_bound(names.names.begin(), names.names.end(), wanted,
+                           [&names, head](const Name& name, std::string_view text) {
+                             return name.head != head ? name.head < head : names.at(name) < text;
+                           });
       return found == names.names.end() ? std::string_view() : names.at(*found);
     };
     if (atLeast(uuid) == uuid) return std::string(uuid);
