@@ -76,10 +76,17 @@ struct KXSyncClient::AssetReconciliation {
 
 Memberships& KXSyncClient::memberships() {
   if (!memberships_) {
-    if (!hostWork_.memberships.valid()) startHostWork();
-    memberships_.emplace(hostWork_.memberships.get());
+    memberships_.emplace(
+        hostWork_.memberships.valid()
+            ? hostWork_.memberships.get()
+            : Memberships(hostAssets(), albumsAndEvents_ ? *albumsAndEvents_ : KXSItemMap()));
   }
   return *memberships_;
+}
+
+void KXSyncClient::forgetMemberships() {
+  memberships_ = std::nullopt;
+  hostWork_.memberships = {};
 }
 
 const KXSAssetMap& KXSyncClient::hostAssets() const {

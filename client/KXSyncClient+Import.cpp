@@ -25,6 +25,22 @@ Value arrayOf(const std::optional<ArrayView>& view) {
   return Value::array(std::move(elements));
 }
 
+// For an asset without a record: in the order of the containers.
+std::vector<std::string_view> albumsThatList(std::string_view asset, const KXSItemMap& containers) {
+  std::vector<std::string_view> keys;
+  for (const auto& entry : containers) {
+    const auto* album = dynamic_cast<const KXSAlbum*>(entry.value.get());
+    const std::optional<ArrayView> assets = album != nullptr ? album->assetUUIDs() : std::nullopt;
+    if (!assets) continue;
+    bool isListed = false;
+    for (std::size_t i = 0; i < assets->size() && !isListed; ++i) {
+      isListed = assets->stringAt(i, kKXSAlbumAssetUUIDsKey) == asset;
+    }
+    if (isListed) keys.push_back(entry.key.stringValue());
+  }
+  return keys;
+}
+
 }  // namespace
 
 void KXSyncClient::_syncAssetTransfer(const FRAssetPtr& request, bool succeeded,
@@ -104,9 +120,13 @@ KXSyncSaveJobPtr KXSyncClient::saveJobForRequest(const FRAsset& request) {
 std::vector<std::string> KXSyncClient::albumURIsForAsset(std::string_view uuid,
                                                          OptionalString eventUUID) {
   std::vector<std::string> uris;
+  if (!albumsAndEvents_) return uris;
   KXSAssetMap::Cursor cursor;
-  if (!albumsAndEvents_ || hostAssets().find(uuid, cursor) == nullptr) return uris;
-  for (const std::string_view container : memberships().containersOf(cursor.place(), eventUUID)) {
+  const std::vector<std::string_view> containers =
+      hostAssets().find(uuid, cursor) != nullptr
+          ? memberships().containersOf(cursor.place(), eventUUID)
+          : albumsThatList(uuid, *albumsAndEvents_);
+  for (const std::string_view container : containers) {
     const std::string* uri = _albumURIForAlbumUUID(container);
     if (uri != nullptr) uris.push_back(*uri);
   }

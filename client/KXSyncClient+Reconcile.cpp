@@ -192,9 +192,10 @@ void KXSyncClient::reconcileSnapshot(const KXSLibraryChangeSnapshotPtr& snapshot
   // An interrupted sync must never be taken for a null sync the next time.
   platform_.files().removeItem(KXPreviousMetadataSyncFilePath, nullptr);
   const KXSItemMapPtr& items = snapshot->albumsAndEventsByUUID();
-  setAlbumsAndEvents(items ? std::make_shared<KXSItemMap>(*items) : nullptr);
+  albumsAndEvents_ = items ? std::make_shared<KXSItemMap>(*items) : nullptr;
   _pullOutMasterAlbumFromAlbumsAndEvents();
-  setUuidToKXSAsset(snapshot->assetsByUUID());
+  uuidToKXSAsset_ = snapshot->assetsByUUID();
+  memberships_ = std::nullopt;  // the host work for this snapshot is under way
   snapshot_ = snapshot;
   isResync_ = isResync;
   _reconcileMetadata();

@@ -149,7 +149,7 @@ void KXSyncClient::setOutstandingSyncJobs(std::optional<SaveJobs> jobs) {
 
 void KXSyncClient::setUuidToKXSAsset(KXSAssetMapPtr assets) {
   uuidToKXSAsset_ = std::move(assets);
-  memberships_ = std::nullopt;
+  forgetMemberships();
 }
 
 void KXSyncClient::setLibraryChangeSnapshot(KXSLibraryChangeSnapshotPtr snapshot) {
@@ -162,7 +162,7 @@ void KXSyncClient::setRestorePathToAssetGroup(std::shared_ptr<AssetGroupMap> gro
 
 void KXSyncClient::setAlbumsAndEvents(KXSItemMapPtr items) {
   albumsAndEvents_ = std::move(items);
-  memberships_ = std::nullopt;
+  forgetMemberships();
 }
 
 void KXSyncClient::setRestoreContext(std::optional<Dictionary> context) {

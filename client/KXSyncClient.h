@@ -210,6 +210,7 @@ class KXSyncClient final : public FRClient {
   // Asset reconciliation.
   const KXSAssetMap& hostAssets() const;
   Memberships& memberships();
+  void forgetMemberships();
   void reconcileAssetsInTransaction();
   void deleteAssets(AssetReconciliation& run);
   void requestNewAssets(AssetReconciliation& run);
@@ -274,12 +275,13 @@ class KXSyncClient final : public FRClient {
   std::optional<SortTokens> sortTokens_;              // assetUUIDtoSortToken
   KXSLibraryChangeSnapshotPtr snapshot_;              // libraryChangeSnapshot
   std::optional<OrderedMap<unsigned>> pendingAssetsPerContainer_;
-  HostWork hostWork_;                             // for the coming reconciliation
+  HostWork hostWork_;  // what has not been taken yet of that for the last reconciliation
   std::shared_ptr<AssetGroupMap> restoreGroups_;  // restorePathToAssetGroup
   std::optional<Dictionary> restoreContext_;
   bool syncRequested_ = false;
-  std::optional<Memberships> memberships_;  // of albumsAndEvents_, when first needed
-  BlockFailure* blockFailure_ = nullptr;    // of the caller who waits for submitted blocks
+  // Of uuidToKXSAsset_ and albumsAndEvents_, when first needed.
+  std::optional<Memberships> memberships_;
+  BlockFailure* blockFailure_ = nullptr;  // of the caller who waits for submitted blocks
 };
 
 }  // namespace kx

@@ -126,7 +126,7 @@ void LibraryContext::readAhead(const std::atomic<bool>& wanted) {
     takeAlbums(rows.albums, ahead.assets);
     ahead.albumsEpoch = albumsEpoch_;
     if (wanted) ahead_ = std::move(ahead);
-  } catch (const SqliteError&) {
+  } catch (const std::exception&) {
     // Whoever needs the rows asks again, and tells of the failure.
   }
   store_->endReading();

@@ -47,7 +47,8 @@ class LibraryContext : public KXManagedObjectContext {
 
   // Reads the synced assets with faces and albums, so that a fetch of them finds all at hand as
   // long as no transaction changes assets. Gives up when `wanted` becomes false; a failure is left
-  // to the fetch itself.
+  // to the fetch itself. Faces and albums are read on a thread of its own, which ends before this
+  // returns.
   void readAhead(const std::atomic<bool>& wanted);
 
   // Shows the row of every synced asset, as long as the visitor wants more of them, if all were

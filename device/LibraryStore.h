@@ -21,8 +21,8 @@ namespace kx {
 
 class LibraryContext;
 
-// The library's tables behind one connection and one serial queue, and the contexts that look at
-// them. Everything but queue, takeChanges and takeCounters is used on that queue alone.
+// The library's tables behind one writing connection and one serial queue, and the contexts that
+// look at them. Everything but queue, takeChanges and takeCounters is used on that queue alone.
 class LibraryStore {
  public:
   struct Parts {
@@ -48,8 +48,9 @@ class LibraryStore {
   void beginReading();
   void endReading();
 
-  // Another connection, for reading on another thread what this one sees, as long as this one is
-  // reading and writes nothing. Null when there can be none.
+  // Another connection, for reading on another thread what this one sees until endReading. Null
+  // when that cannot be: nothing is being read, a plan has changed something, there is no file, or
+  // it cannot be opened.
   std::unique_ptr<SqliteDatabase> openBeside();
 
   using Work = std::function<void(LibraryWriter&)>;

@@ -152,8 +152,9 @@ void SqliteDatabase::refuseCommits() {
 }
 
 std::string SqliteDatabase::path() const {
+  // One in memory may have a name all the same.
   const char* const path = sqlite3_db_filename(connection_, "main");
-  return path == nullptr ? std::string() : path;
+  return path == nullptr || *path != '/' ? std::string() : path;
 }
 
 std::uint64_t SqliteDatabase::rowsWritten() const {

@@ -82,7 +82,10 @@ TEST_F(ImportTest, OneMissingCoordinateReadsAsZero) {
 }
 
 TEST_F(ImportTest, AnAssetWithoutRecordMakesAJobOfItsIdentifier) {
-  ASSERT_TRUE(reconcile(SnapshotBuilder()));
+  ASSERT_TRUE(reconcile(SnapshotBuilder()
+                            .album("AL1", "One", {"X", "Y"})
+                            .event("X", "Day")
+                            .album("AL2", "Two", {"Y"})));
   const FRAssetPtr r = FRAsset::downloadAssetWithIdentifier("X", "Photo", std::nullopt);
   client->outstandingAssets()->append(r);
   arrive(r);
@@ -91,6 +94,22 @@ TEST_F(ImportTest, AnAssetWithoutRecordMakesAJobOfItsIdentifier) {
   EXPECT_FALSE(job.isVideo);
   EXPECT_TRUE(job.facesInfo.isNull());
   EXPECT_EQ(job.location, std::nullopt);
+  EXPECT_EQ(job.albumURIs, Texts{*client->_albumURIForAlbumUUID("AL1")});
+}
+
+// Whatever was known of the libraries before.
+TEST_F(ImportTest, AlbumsAreThoseOfTheRecordsAtHand) {
+  SnapshotBuilder::Asset host;
+  host.uuid = "A";
+  ASSERT_TRUE(reconcile(
+      SnapshotBuilder().asset(host).album("AL1", "One", {"A"}).album("AL2", "Two", {"B"})));
+  auto assets = std::make_shared<KXSAssetMap>();
+  for (const char* uuid : {"C", "B"}) assets->set(uuid, KXSAsset::assetWithUUID(uuid));
+  client->setUuidToKXSAsset(assets);
+  const FRAssetPtr r = FRAsset::downloadAssetWithIdentifier("B", "Photo", std::nullopt);
+  client->outstandingAssets()->append(r);
+  arrive(r);
+  EXPECT_EQ(onlyJob().albumURIs, Texts{*client->_albumURIForAlbumUUID("AL2")});
 }
 
 TEST_F(ImportTest, AlbumURIsFollowTheContainersThatAreOnTheDevice) {

@@ -95,6 +95,38 @@ TEST_F(ReadAheadTest, AFetchFindsAllAtHand) {
   EXPECT_EQ(shown(), held());
 }
 
+// The library's connection reads the asset rows alone: version, assets, albums.
+TEST_F(ReadAheadTest, RelationsAreReadBesideTheAssets) {
+  makeAssets(3);
+  library_.reset();
+  device().drain();
+  device().takeCounters();
+  readAhead();
+  EXPECT_EQ(device().takeCounters().statements, 3U);
+}
+
+// What a plan has done is nowhere but in its own connection.
+TEST_F(ReadAheadTest, RelationsThatArePlannedAreSeen) {
+  makeAssets(3);
+  makeContainer("ALBUM");
+  close();
+  DeviceOptions plan = options();
+  plan.planOnly = true;
+  open(plan);
+  transaction([&] {
+    const KXManagedAssetPtr asset = library().assetWithUUID(name(1));
+    asset->addFace(Rect{0.1, 0.2, 0.3, 0.4}, 7, std::nullopt);
+    library().albumWithUUID("ALBUM")->asManagedAlbum()->addAssetUsingTesselAlbumOrder(asset);
+  });
+  library_.reset();
+  device().drain();
+  readAhead();
+  const Library all = shown();
+  EXPECT_EQ(all.size(), 3U);
+  EXPECT_EQ(all.at(name(1)).faces, std::vector<std::uint16_t>{7});
+  EXPECT_EQ(all.at(name(1)).albums, std::set<std::string>{"ALBUM"});
+}
+
 TEST_F(ReadAheadTest, WhatIsImportedMeanwhileIsSeen) {
   makeAssets(2);
   readAhead();
