@@ -22,11 +22,17 @@ function(_kx_unity target)
   set_target_properties(${target} PROPERTIES UNITY_BUILD ON UNITY_BUILD_MODE GROUP)
 endfunction()
 
-# kx_library(NAME [GLOBS pattern...] [EXCLUDE regex] [DEPS target...])
+# What is compiled for longer than the tests run in it is not worth optimising for them.
+function(_kx_not_optimised_for_tests target)
+  target_compile_options(${target} PRIVATE $<$<CONFIG:Debug>:-O0>)
+endfunction()
+
+# kx_library(NAME [COLD] [GLOBS pattern...] [EXCLUDE regex] [DEPS target...])
 # A static library of all *.cpp below the calling folder (or of GLOBS), less the paths that match
-# EXCLUDE (relative to the folder). A folder without sources becomes an INTERFACE library.
+# EXCLUDE (relative to the folder). A folder without sources becomes an INTERFACE library. COLD: the
+# tests spend little time in it.
 function(kx_library name)
-  cmake_parse_arguments(arg "" "EXCLUDE" "GLOBS;DEPS" ${ARGN})
+  cmake_parse_arguments(arg "COLD" "EXCLUDE" "GLOBS;DEPS" ${ARGN})
   if(NOT arg_GLOBS)
     set(arg_GLOBS *.cpp)
   endif()
@@ -38,6 +44,9 @@ function(kx_library name)
     add_library(${name} STATIC ${sources})
     _kx_unity(${name})
     target_link_libraries(${name} PUBLIC kx_options ${arg_DEPS})
+    if(arg_COLD)
+      _kx_not_optimised_for_tests(${name})
+    endif()
   else()
     add_library(${name} INTERFACE)
     target_link_libraries(${name} INTERFACE kx_options ${arg_DEPS})
@@ -127,8 +136,7 @@ function(kx_test folder)
   target_link_libraries(${target} PRIVATE kx_options kx_test_support ${arg_LIBRARIES} kx_testing
                         rapidcheck
                         GTest::gmock_main GTest::gmock GTest::gtest)
-  # Compiling the tests costs more than running them: they are not worth optimising.
-  target_compile_options(${target} PRIVATE $<$<CONFIG:Debug>:-O0>)
+  _kx_not_optimised_for_tests(${target})
   target_compile_definitions(${target} PRIVATE
     KX_TEST_SOURCE_DIR="${PROJECT_SOURCE_DIR}"
     KX_TEST_BIN_DIR="${CMAKE_RUNTIME_OUTPUT_DIRECTORY}"
