@@ -41,8 +41,9 @@ class Memberships {
   // call.
   const MembershipChanges& changesFor(std::size_t pair,
                                       std::span<const KXGenericAlbumPtr> onDevice);
-  // The keys of the albums that list the asset and of the event of that identifier, each once, in
-  // the order of the containers. Good until the next call of another function.
+  // The keys of the albums that list the asset at a place of that map, and of the event of that
+  // identifier, each once, in the order of the containers. Good until the next call of another
+  // function.
   std::vector<std::string_view> containersOf(std::size_t place, OptionalString event) const;
 
  private:

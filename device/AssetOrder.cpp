@@ -31,7 +31,7 @@ AssetOrder::Album::Album(Value indexes) : indexes_(std::move(indexes)) {
 std::optional<std::int64_t> AssetOrder::Album::indexOf(std::string_view assetUUID,
                                                        std::uint32_t expected) const {
   if (EntryPeek::can(indexes_)) {
-    // The entries stand in the order of their indexes.
+    // As the file is written, an entry stands where its index says.
     const auto found = EntryPeek::find(indexes_, assetUUID, expected);
     if (!found || found->kind() != Kind::kNumber) return std::nullopt;
     return found->number().int64Value();

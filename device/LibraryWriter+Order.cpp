@@ -95,7 +95,7 @@ std::vector<Member> LibraryWriter::membersOf(RowId album, const AssetOrder::Albu
   std::vector<Member> members;
   SqliteStatement row(database_, "SELECT asset, position FROM memberships WHERE album = ?");
   row.integer(album);
-  std::uint32_t next = 0;
+  std::uint32_t next = 0;  // rows mostly come in the order of the indexes
   while (row.step()) {
     Member member{row.integerAt(0), std::nullopt, row.optionalIntegerAt(1)};
     if (order.tag() != 0) {
@@ -103,7 +103,7 @@ std::vector<Member> LibraryWriter::membersOf(RowId album, const AssetOrder::Albu
         member.index = order.indexOf(uuid, next);
       });
     }
-    if (member.index) next = static_cast<std::uint32_t>(*member.index) + 1;  // mostly
+    if (member.index) next = static_cast<std::uint32_t>(*member.index) + 1;
     members.push_back(member);
   }
   return members;
